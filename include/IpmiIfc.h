@@ -1,0 +1,145 @@
+#ifndef TAV_IPMI_IPMIIFC_H
+#define TAV_IPMI_IPMIIFC_H
+
+#include <stdint.h>
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "CmpiStatus.h"
+#include "IpmiEntity.h"
+#include "IpmiNode.h"
+#include "TavIpmiExport.h"
+
+namespace Ipmi {
+
+class IpmiLan;
+class IpmiSensor;
+
+// What a wake-up of the polling loop asks for.
+enum IPMI_POLL_TYPE {
+    IPMI_POLL_NONE = 0,
+    IPMI_POLL_NORMAL = 1,
+    IPMI_POLL_FULL = 2,
+    IPMI_POLL_SENSORS = 3,
+    IPMI_POLL_SEL = 4
+};
+
+// The stored Get Device ID answer, completion code first.
+struct ipmiifc_device_id {
+    uint8_t cc;
+    uint8_t device_id;
+    uint8_t device_revision;
+    uint8_t fw_rev1;
+    uint8_t fw_rev2;
+    uint8_t ipmi_version;
+    uint8_t additional_support;
+    uint8_t manufacturer_id[3];  // least significant byte first
+    uint8_t product_id[2];
+    uint8_t aux_fw_rev[4];
+} __attribute__((packed));
+
+// The stored Get SDR Repository Info answer, completion code first.
+struct ipmiifc_sdr_info {
+    uint8_t cc;
+    uint8_t version;
+    uint16_t record_count;
+    uint16_t free_space;
+    uint32_t addition_timestamp;
+    uint32_t erase_timestamp;
+    uint8_t operation_support;
+} __attribute__((packed));
+
+// Public entry points; every per-node operation has an overload for node 0.
+class TAV_IPMI_API IpmiIfc {
+public:
+    enum IPMI_STATE {
+        IPMI_STATE_INIT = 1,
+        IPMI_STATE_STARTING = 2,
+        IPMI_STATE_RUNNING = 4,
+        IPMI_STATE_STOPPED = 8,
+        IPMI_STATE_CLI = 16
+    };
+
+    // Interface states.
+    static int getState(int node);
+    static int getState();
+    static int waitState(int node, int mask);
+    static int waitState(int mask);
+    static int timedWaitState(int node, int mask, long sec, long usec);
+    static int timedWaitState(int mask, long sec, long usec);
+
+    // Life cycle and polling.
+    static void start(int node, int interval);
+    static void start(int interval);
+    static void stop(int node);
+    static void stop();
+    static void poll(int node);
+    static void doPoll(int node);
+    static void doPoll();
+    static void setPollingInterval(int node, int interval);
+    static void setPollingInterval(int interval);
+    static int getPollingInterval(int node);
+    static int getPollingInterval();
+    static void pollAll(int nodeCount, bool serial, IPMI_POLL_TYPE type, bool* shutdown);
+
+    // Raw commands. resp_buf[0] is the completion code.
+    static uint8_t sendCmd(int node, uint8_t cmd, uint8_t netfn, uint16_t data_len, uint8_t* data,
+                           uint16_t* resp_len, uint8_t* resp_buf);
+    static uint8_t sendCmd(uint8_t cmd, uint8_t netfn, uint16_t data_len, uint8_t* data,
+                           uint16_t* resp_len, uint8_t* resp_buf);
+
+    // Controller identity and host properties.
+    static int identifyChassis(int node, unsigned char interval, unsigned char force);
+    static int identifyChassis(unsigned char interval, unsigned char force);
+    static int convertToGeneratorId(int address, int channel, int lun);
+    static int getManufacturerId(int node, unsigned char* id, unsigned char& count);
+    static int getManufacturerId(unsigned char* id, unsigned char& count);
+    static int getManagementControllerInfo(int node, ipmiifc_device_id& out);
+    static const char* getManufacturerName(unsigned int id);
+    static std::string GetBmcManufacturer();
+    static std::string GetBmcFWVersion();
+    static std::string GetBmcIpmiVersion();
+    static std::string GetBmcReportedOSName();
+    static std::string GetBmcReportedOSVersion();
+    static bool SetOSInfo(const std::string& osName, const std::string& osVersion);
+    static IpmiLan* GetBMCNetworking();
+    static bool hpe_bmc;
+
+    // SDR repository.
+    static ipmiifc_sdr_info getSdr(int node);
+
+    // Sensors.
+    static std::vector<std::shared_ptr<IpmiSensor>> getSensors(int node);
+    static std::vector<std::shared_ptr<IpmiSensor>> getSensors();
+    static std::shared_ptr<IpmiSensor> getSensor(int node, unsigned owner, unsigned number);
+    static std::shared_ptr<IpmiSensor> getSensor(unsigned owner, unsigned number);
+
+    // Entities.
+    static std::vector<IpmiEntity> getEntities(int node);
+    static std::vector<IpmiEntity> getEntities();
+    static IpmiEntity getEntityParent(int node, unsigned int id, unsigned int instance);
+    static IpmiEntity getEntityParent(unsigned int id, unsigned int instance);
+
+    // SEL event handlers.
+    static int registerSelEventHandler(int node, IpmiSelEventHandler handler, void* context);
+    static int registerSelEventHandler(IpmiSelEventHandler handler, void* context);
+    static int unRegisterSelEventHandler(int node, IpmiSelEventHandler handler);
+    static int unRegisterSelEventHandler(IpmiSelEventHandler handler);
+    static bool generatesMemoryEvents(int node);
+
+    // LAN configuration.
+    static IpmiLan* getLan(int node);
+    static IpmiLan* getLan();
+};
+
+// Command-line mode: no polling loop; the caller opens the device first.
+TAV_IPMI_API int IpmiIfcInitForCLI(int node);
+TAV_IPMI_API void IpmiIfcCloseForCLI(int node);
+TAV_IPMI_API int IpmiIfcOpenIpmiOpen(int node);
+TAV_IPMI_API void IpmiIfcOpenIpmiClose(int node);
+
+}  // namespace Ipmi
+
+#endif

@@ -1,0 +1,71 @@
+#ifndef TAV_IPMI_SIM_BMC_H
+#define TAV_IPMI_SIM_BMC_H
+
+// The simulated controller: a model plus a table of command handlers.
+
+#include <stdint.h>
+
+#include <functional>
+#include <map>
+#include <string>
+#include <vector>
+
+#include "Sim.h"
+
+namespace Sim {
+
+struct Identity {
+    uint8_t deviceId = 0x20;
+    uint8_t deviceRevision = 0x01;
+    uint8_t fwMajor = 0x02;  // bit 7 clear: device available
+    uint8_t fwMinor = 0x10;  // BCD
+    uint8_t ipmiVersion = 0x02;
+    uint8_t additionalSupport = 0xBF;
+    uint32_t manufacturerId = 674;
+    uint16_t productId = 0x0100;
+    uint8_t auxFw[4] = {0, 0, 0, 0};
+    bool hasDeviceSdrs = false;
+};
+
+// One system information parameter, stored as the 16-byte blocks a Set wrote.
+struct SysInfoParameter {
+    std::map<uint8_t, std::vector<uint8_t>> blocks;  // set selector -> 16 bytes
+};
+
+class Bmc {
+public:
+    using Handler = std::function<Response(Bmc&, const Request&)>;
+
+    Bmc();
+    virtual ~Bmc() = default;
+
+    // Registers (or replaces) the handler of one command.
+    void on(uint8_t netfn, uint8_t cmd, Handler handler);
+    // Answers a request; 0xC1 for a command it does not know.
+    Response handle(const Request& req);
+
+    // Sets a string parameter (4 = OS name, 5 = OS version) as a host would.
+    void setSystemInfoString(uint8_t parameter, const std::string& value, uint8_t encoding = 0);
+    std::string systemInfoString(uint8_t parameter) const;
+
+    Identity identity;
+    uint8_t selfTestResult = 0x55;
+    uint8_t selfTestDetail = 0x00;
+    std::map<uint8_t, SysInfoParameter> systemInfo;
+    uint8_t identifyInterval = 0;
+    bool identifyForced = false;
+
+private:
+    void registerStandardHandlers();
+    std::map<uint16_t, Handler> handlers_;
+};
+
+// Builds a controller from an ipmi_sim emulator command file.
+// Throws std::runtime_error("file:line: message") on a syntax error.
+std::shared_ptr<Bmc> loadProfile(const std::string& path);
+// The project's own profile of a plausible server.
+std::string defaultProfilePath();
+
+}  // namespace Sim
+
+#endif

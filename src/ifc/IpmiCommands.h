@@ -1,0 +1,74 @@
+#ifndef TAV_IPMI_IPMICOMMANDS_H
+#define TAV_IPMI_IPMICOMMANDS_H
+
+#include <stdint.h>
+
+// IPMI v2.0 network functions, commands and completion codes, named once for
+// the library, the simulated controller and the tests.
+namespace Ipmi {
+namespace netfn {
+constexpr uint8_t chassis = 0x00;
+constexpr uint8_t sensorEvent = 0x04;
+constexpr uint8_t app = 0x06;
+constexpr uint8_t storage = 0x0A;
+constexpr uint8_t transport = 0x0C;
+}  // namespace netfn
+
+namespace cmd {
+// Chassis
+constexpr uint8_t chassisIdentify = 0x04;
+// Sensor/Event
+constexpr uint8_t setLastProcessedEventId = 0x14;
+constexpr uint8_t getLastProcessedEventId = 0x15;
+constexpr uint8_t setSensorHysteresis = 0x24;
+constexpr uint8_t getSensorHysteresis = 0x25;
+constexpr uint8_t setSensorThresholds = 0x26;
+constexpr uint8_t getSensorThresholds = 0x27;
+constexpr uint8_t setSensorEventEnable = 0x28;
+constexpr uint8_t getSensorEventEnable = 0x29;
+constexpr uint8_t rearmSensorEvents = 0x2A;
+constexpr uint8_t getSensorReading = 0x2D;
+// App
+constexpr uint8_t getDeviceId = 0x01;
+constexpr uint8_t getSelfTestResults = 0x04;
+constexpr uint8_t getChannelInfo = 0x42;
+constexpr uint8_t setSystemInfoParameters = 0x58;
+constexpr uint8_t getSystemInfoParameters = 0x59;
+// Storage
+constexpr uint8_t getFruInventoryAreaInfo = 0x10;
+constexpr uint8_t readFruData = 0x11;
+constexpr uint8_t getSdrRepositoryInfo = 0x20;
+constexpr uint8_t reserveSdrRepository = 0x22;
+constexpr uint8_t getSdr = 0x23;
+constexpr uint8_t getSelInfo = 0x40;
+constexpr uint8_t getSelAllocationInfo = 0x41;
+constexpr uint8_t reserveSel = 0x42;
+constexpr uint8_t getSelEntry = 0x43;
+constexpr uint8_t clearSel = 0x47;
+constexpr uint8_t getSelTime = 0x48;
+// Transport
+constexpr uint8_t getLanConfigParameters = 0x02;
+}  // namespace cmd
+
+namespace cc {
+constexpr uint8_t ok = 0x00;
+constexpr uint8_t parameterNotSupported = 0x80;  // system info / LAN parameters
+constexpr uint8_t nodeBusy = 0xC0;
+constexpr uint8_t invalidCommand = 0xC1;
+constexpr uint8_t timeout = 0xC3;
+constexpr uint8_t outOfSpace = 0xC4;
+constexpr uint8_t reservationCancelled = 0xC5;
+constexpr uint8_t requestDataTruncated = 0xC6;
+constexpr uint8_t requestDataLengthInvalid = 0xC7;
+constexpr uint8_t requestDataFieldLengthExceeded = 0xC8;
+constexpr uint8_t parameterOutOfRange = 0xC9;
+constexpr uint8_t cannotReturnRequestedBytes = 0xCA;
+constexpr uint8_t requestedSensorNotPresent = 0xCB;
+constexpr uint8_t invalidDataField = 0xCC;
+constexpr uint8_t illegalForSensorType = 0xCD;
+constexpr uint8_t responseNotProvided = 0xCE;
+constexpr uint8_t unspecifiedError = 0xFF;
+}  // namespace cc
+}  // namespace Ipmi
+
+#endif

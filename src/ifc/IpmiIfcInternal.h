@@ -1,0 +1,143 @@
+#ifndef TAV_IPMI_IPMIIFCINTERNAL_H
+#define TAV_IPMI_IPMIIFCINTERNAL_H
+
+// Interface code shared by the library's subsystems; not installed.
+
+#include <stdint.h>
+
+#include <memory>
+#include <string>
+
+#include "IpmiCommands.h"
+#include "IpmiIfc.h"
+#include "IpmiLog.h"
+#include "IpmiNode.h"
+
+namespace Ipmi {
+
+class IpmiSensor;
+
+// One request as callers build it, usually on their stack.
+struct ipmiifc_req {
+    uint64_t reserved0;
+    uint32_t reserved1;
+    uint32_t msgid;
+    uint8_t netfn;
+    uint8_t cmd;
+    uint16_t data_len;
+    uint32_t reserved2;
+    uint8_t* data;
+};
+
+enum { IPMIIFC_RESP_MAX = 32 };
+
+// One response; data[0] is the completion code. Freed with IpmiIfcRespDel.
+struct ipmiifc_resp {
+    uint32_t data_len;
+    uint8_t data[IPMIIFC_RESP_MAX];
+    int32_t node;
+    uint8_t* req_addr;
+    uint32_t req_addr_len;
+    int64_t req_msgid;
+    uint8_t* req_data;
+    uint8_t cc;  // copy of data[0], or 255 when the exchange failed
+};
+
+enum { IPMIIFC_FLAG_ECHO_REQUEST = 1 };
+
+// Node state (lifecycle guarded transitions).
+void _setState(int node, IpmiIfc::IPMI_STATE s);
+int _getState(int node);
+void _changeState(int node, IpmiIfc::IPMI_STATE from, IpmiIfc::IPMI_STATE to);
+
+// Driver transport.
+void ReopenPort(int node);
+void IpmiIfcSetTimingParms(int node);
+int IpmiIfcOpenIpmiEventEnable(int node, int* flag);
+int IpmiIfcOpenIpmiAddressSet(int node);
+int IpmiIfcRespNew(ipmiifc_resp** out);
+int IpmiIfcRespReuse(ipmiifc_resp* r);
+int IpmiIfcRespDel(ipmiifc_resp** r);
+ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiifc_resp* reuse);
+ipmiifc_resp* IpmiIfcSend(int node, ipmiifc_req* req, int flags);
+ipmiifc_resp* IpmiIfcSendCmd(int node, uint8_t cmd, uint8_t netfn, long ignored, uint16_t data_len,
+                             uint8_t* data, int flags);
+
+// Frees a transport response when it goes out of scope.
+class RespHolder {
+public:
+    explicit RespHolder(ipmiifc_resp* r = nullptr) : resp_(r) {}
+    ~RespHolder() {
+        if (resp_) IpmiIfcRespDel(&resp_);
+    }
+    RespHolder(const RespHolder&) = delete;
+    RespHolder& operator=(const RespHolder&) = delete;
+    ipmiifc_resp* get() const { return resp_; }
+    ipmiifc_resp* operator->() const { return resp_; }
+    explicit operator bool() const { return resp_ != nullptr; }
+    ipmiifc_resp* release() {
+        ipmiifc_resp* r = resp_;
+        resp_ = nullptr;
+        return r;
+    }
+    void reset(ipmiifc_resp* r) {
+        if (resp_) IpmiIfcRespDel(&resp_);
+        resp_ = r;
+    }
+
+private:
+    ipmiifc_resp* resp_;
+};
+
+// Controller identity (one-shot commands and their handlers).
+int IpmiIfcDataGet(int count);
+int IpmiIfcRhGetDeviceId(ipmiifc_resp* r);
+int IpmiIfcRhGetSelfTest(ipmiifc_resp* r);
+int IpmiIfcRhGetOS_Name(ipmiifc_resp* r);
+int IpmiIfcRhGetOS_Version(ipmiifc_resp* r);
+bool set_bmc_prop(const char* value, unsigned int length, unsigned char parameter, unsigned char* ccOut);
+
+// Polling rhythm tunables.
+extern int SKIP_SDR_STEP;
+extern int SKIP_FRU_STEP;
+
+// SDR repository.
+uint32_t IpmiIfcSdrGetInfo(int node);
+uint32_t IpmiIfcRhGetSdrInfo(ipmiifc_resp* resp);
+uint32_t IpmiIfcSdrReserve(int node);
+uint32_t IpmiIfcSdrGetHeaders(int node);
+uint32_t IpmiIfcSdrReadRecordId(int node, uint16_t record_id, uint8_t* buffer, uint8_t length);
+uint32_t IpmiIfcSdrListAdd(int node, ipmiifc_sdr_list* element);
+uint32_t IpmiIfcSdrReadAll(int node);
+uint32_t IpmiIfcSdrGetAll(int node);
+void IpmiIfcSdrCleanUpHeaders(int node);
+void IpmiIfcSdrCleanUpAll(int node);
+
+// Sensors.
+struct ipmiifc_sensor_reading_list {
+    ipmiifc_sensor_reading_list* next;
+    ipmiifc_sdr_list* sdr;
+    uint8_t reading[5];
+};
+int IpmiIfcSensorInstantiateAll(int node);
+int IpmiIfcSensorGetThresholds(int node, ipmiifc_sdr_list* sdr, std::shared_ptr<IpmiSensor> sensor);
+int IpmiIfcSensorGetReading(int node, ipmiifc_sensor_reading_list* r);
+int IpmiIfcSensorUpdateReading(int node);
+
+// Entities.
+uint32_t IpmiIfcEntityListCreate(int node);
+uint32_t IpmiIfcEntityInstantiateAll(int node);
+void IpmiIfcEntityCleanUpAll(int node);
+
+// SEL.
+uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count);
+int IpmiIfcRhSelInfoNoCount(ipmiifc_resp* resp);
+int IpmiIfcRhSelGetAllocInfo(ipmiifc_resp* resp);
+void IpmiIfcSelCleanUpEventHandlers(int node);
+
+// FRU inventory.
+int IpmiIfcFruInstantiateAll(int node);
+
+}  // namespace Ipmi
+
+#endif

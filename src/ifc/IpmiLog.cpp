@@ -1,0 +1,40 @@
+#include "IpmiLog.h"
+
+#include <errno.h>
+#include <stdarg.h>
+#include <stdio.h>
+
+#include <atomic>
+#include <mutex>
+
+namespace Ipmi {
+
+namespace {
+std::mutex sinkMutex;
+IpmiLogSink sinkFn = nullptr;
+void* sinkContext = nullptr;
+}  // namespace
+
+void setLogSink(IpmiLogSink sink, void* context) {
+    std::lock_guard<std::mutex> guard(sinkMutex);
+    sinkFn = sink;
+    sinkContext = context;
+}
+
+void ipmiLog(int priority, const char* format, ...) {
+    char text[1024];
+    va_list args;
+    va_start(args, format);
+    vsnprintf(text, sizeof text, format, args);  // glibc expands %m like syslog
+    va_end(args);
+    {
+        std::lock_guard<std::mutex> guard(sinkMutex);
+        if (sinkFn) {
+            sinkFn(priority, text, sinkContext);
+            return;
+        }
+    }
+    syslog(priority, "%s", text);
+}
+
+}  // namespace Ipmi
