@@ -14,7 +14,20 @@ Response ccOnly(uint8_t code) { return Response{code}; }
 bool lengthIs(const Request& r, size_t n) { return r.data.size() == n; }
 }  // namespace
 
-Bmc::Bmc() { registerStandardHandlers(); }
+Bmc::Bmc() {
+    registerStandardHandlers();
+    registerSdrHandlers(*this);
+    registerSensorHandlers(*this);
+    registerSelHandlers(*this);
+    registerLanHandlers(*this);
+    registerFruHandlers(*this);
+}
+
+SensorModel* Bmc::findSensor(uint8_t owner, uint8_t lun, uint8_t number) {
+    for (auto& s : sensors)
+        if (s.owner == owner && s.lun == lun && s.number == number) return &s;
+    return nullptr;
+}
 
 void Bmc::on(uint8_t netfn, uint8_t cmd, Handler handler) { handlers_[key(netfn, cmd)] = std::move(handler); }
 

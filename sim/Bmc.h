@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "BmcModels.h"
 #include "Sim.h"
 
 namespace Sim {
@@ -54,11 +55,26 @@ public:
     std::map<uint8_t, SysInfoParameter> systemInfo;
     uint8_t identifyInterval = 0;
     bool identifyForced = false;
+    SdrModel sdr;
+    std::vector<SensorModel> sensors;
+    SelModel sel;
+    LanModel lan;
+    FruModel fru;
+
+    // The sensor a request addresses, or null.
+    SensorModel* findSensor(uint8_t owner, uint8_t lun, uint8_t number);
 
 private:
     void registerStandardHandlers();
     std::map<uint16_t, Handler> handlers_;
 };
+
+// Each area registers its command handlers on a new controller.
+void registerSdrHandlers(Bmc& bmc);
+void registerSensorHandlers(Bmc& bmc);
+void registerSelHandlers(Bmc& bmc);
+void registerLanHandlers(Bmc& bmc);
+void registerFruHandlers(Bmc& bmc);
 
 // Builds a controller from an ipmi_sim emulator command file.
 // Throws std::runtime_error("file:line: message") on a syntax error.

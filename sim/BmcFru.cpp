@@ -1,0 +1,8 @@
+#include "Bmc.h"
+#include "IpmiCommands.h"
+
+namespace Sim {
+
+void registerFruHandlers(Bmc&) {}
+
+}  // namespace Sim

@@ -1,0 +1,86 @@
+#ifndef TAV_IPMI_SIM_BMCMODELS_H
+#define TAV_IPMI_SIM_BMCMODELS_H
+
+// State of the simulated controller, one structure per area. Each area's
+// command handlers live in their own file (BmcSdr.cpp, BmcSensors.cpp, ...).
+
+#include <stdint.h>
+
+#include <map>
+#include <string>
+#include <vector>
+
+namespace Sim {
+
+// SDR repository: whole records (5-byte header + body), in repository order.
+struct SdrModel {
+    std::vector<std::vector<uint8_t>> records;
+    uint8_t version = 0x51;
+    uint16_t reservation = 0;  // 0: none granted yet
+    uint32_t additionTimestamp = 0;
+    uint32_t eraseTimestamp = 0;
+    uint8_t operationSupport = 0x23;  // reserve supported, non-modal update, no allocation info
+    // Largest record slice one Get SDR answers; asking more gives 0xCA.
+    uint8_t maxReadBytes = 28;
+};
+
+// One sensor, addressed by owner (slave address), LUN, channel and number.
+struct SensorModel {
+    uint8_t owner = 0x20;
+    uint8_t lun = 0;
+    uint8_t channel = 0;
+    uint8_t number = 0;
+    uint8_t type = 0;
+    uint8_t eventReadingType = 0;
+    bool present = true;
+    bool eventOnly = false;
+    uint8_t reading = 0;
+    uint8_t statusBits = 0xC0;  // event messages and scanning enabled
+    uint16_t states = 0;        // discrete states / threshold comparison bits
+    uint8_t thresholds[6] = {0, 0, 0, 0, 0, 0};  // LNC, LC, LNR, UNC, UC, UNR
+    uint8_t readableMask = 0;
+    uint8_t settableMask = 0;
+    uint8_t hysteresisPositive = 0;
+    uint8_t hysteresisNegative = 0;
+    uint8_t eventFlags = 0xC0;
+    uint16_t assertEnables = 0;
+    uint16_t deassertEnables = 0;
+    uint8_t eventSupport = 0;  // SDR capability bits 1:0
+};
+
+struct SelModel {
+    uint8_t version = 0x51;
+    uint16_t entries = 0;
+    uint16_t freeSpace = 0x4000;
+    uint32_t additionTimestamp = 0;
+    uint32_t eraseTimestamp = 0;
+    uint8_t operationSupport = 0x0F;
+    std::vector<std::vector<uint8_t>> records;  // 16-byte SEL records
+    bool enabled = true;
+    uint16_t allocationUnits = 1024;
+    uint16_t allocationUnitSize = 16;
+};
+
+struct LanChannelModel {
+    uint8_t number = 1;
+    uint8_t medium = 4;  // 802.3 LAN
+    uint8_t protocol = 1;
+};
+
+struct LanModel {
+    std::vector<LanChannelModel> channels{LanChannelModel{}};
+    // Parameter number -> parameter data (after the revision byte).
+    std::map<uint8_t, std::vector<uint8_t>> parameters;
+};
+
+struct FruDeviceModel {
+    std::vector<uint8_t> data;
+};
+
+struct FruModel {
+    std::map<uint8_t, FruDeviceModel> devices;  // FRU device id -> image
+};
+
+}  // namespace Sim
+
+#endif
