@@ -1,0 +1,23 @@
+#!/usr/bin/env bash
+# Installs what building and testing tav-ipmi needs on Debian, if missing.
+set -euo pipefail
+
+need=()
+command -v cmake >/dev/null || need+=(cmake)
+command -v g++ >/dev/null || need+=(g++)
+command -v make >/dev/null || need+=(make)
+[ -f /usr/include/gtest/gtest.h ] || need+=(libgtest-dev)
+[ -f /usr/include/gmock/gmock.h ] || need+=(libgmock-dev)
+[ -f /usr/include/benchmark/benchmark.h ] || need+=(libbenchmark-dev)
+[ -f /usr/include/linux/ipmi.h ] || need+=(linux-libc-dev)
+command -v pkg-config >/dev/null || need+=(pkg-config)
+# Independent IPMI clients: they check the simulator and our decodings.
+command -v ipmitool >/dev/null || need+=(ipmitool)
+command -v ipmi-sensors >/dev/null || need+=(freeipmi-tools)
+
+if [ ${#need[@]} -gt 0 ]; then
+  sudo=""
+  [ "$(id -u)" -ne 0 ] && sudo="sudo"
+  $sudo apt-get update -qq
+  DEBIAN_FRONTEND=noninteractive $sudo apt-get install -y -qq --no-install-recommends "${need[@]}"
+fi
