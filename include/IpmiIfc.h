@@ -139,6 +139,9 @@ TAV_IPMI_API int IpmiIfcInitForCLI(int node);
 TAV_IPMI_API void IpmiIfcCloseForCLI(int node);
 TAV_IPMI_API int IpmiIfcOpenIpmiOpen(int node);
 TAV_IPMI_API void IpmiIfcOpenIpmiClose(int node);
+// Reads the SDR repository when it changed and rebuilds sensors and entities
+// from it (the polling loop does this by itself; one-shot tools call it).
+TAV_IPMI_API uint32_t IpmiIfcSdrGetInfo(int node);
 
 }  // namespace Ipmi
 

@@ -102,7 +102,6 @@ extern int SKIP_SDR_STEP;
 extern int SKIP_FRU_STEP;
 
 // SDR repository.
-uint32_t IpmiIfcSdrGetInfo(int node);
 uint32_t IpmiIfcRhGetSdrInfo(ipmiifc_resp* resp);
 uint32_t IpmiIfcSdrReserve(int node);
 uint32_t IpmiIfcSdrGetHeaders(int node);
