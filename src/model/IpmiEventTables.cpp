@@ -1,0 +1,706 @@
+#include "IpmiEventTables.h"
+
+#include <stdio.h>
+#include <stdlib.h>
+
+#include <array>
+
+#include "IpmiLog.h"
+
+namespace Ipmi {
+
+namespace {
+
+// Names of the event/reading types and of the sensor types, as the rows carry them.
+constexpr char kThreshold[] = "Threshold";
+constexpr char kUsageState[] = "Usage State";
+constexpr char kDigitalState[] = "Digital State";
+constexpr char kSeverityState[] = "Severity State";
+constexpr char kAvailabilityState[] = "Availability State";
+constexpr char kRedundancyState[] = "Redundancy State";
+constexpr char kAcpiDevicePowerState[] = "ACPI Device Power State";
+constexpr char kAddInCard[] = "Add-in Card";
+constexpr char kCableInterconnect[] = "Cable/Interconnect";
+constexpr char kTemperature[] = "Temperature";
+constexpr char kVoltage[] = "Voltage";
+constexpr char kCurrent[] = "Current";
+constexpr char kFan[] = "Fan";
+constexpr char kPhysicalSecurity[] = "Physical Security";
+constexpr char kPlatformSecurity[] = "Platform Security";
+constexpr char kProcessor[] = "Processor";
+constexpr char kPowerSupply[] = "Power Supply";
+constexpr char kPowerUnit[] = "Power Unit";
+constexpr char kCoolingDevice[] = "Cooling Device";
+constexpr char kOtherUnitsBasedSensor[] = "Other Units-based Sensor";
+constexpr char kMemory[] = "Memory";
+constexpr char kDriveSlot[] = "Drive Slot";
+constexpr char kPostMemoryResize[] = "POST Memory Resize";
+constexpr char kSystemFirmwareError[] = "System Firmware Error";
+constexpr char kSystemFirmwareHang[] = "System Firmware Hang";
+constexpr char kSystemFirmwareProgress[] = "System Firmware Progress";
+constexpr char kEventLoggingDisabled[] = "Event Logging Disabled";
+constexpr char kWatchdog1[] = "Watchdog 1";
+constexpr char kSystemEvent[] = "System Event";
+constexpr char kCriticalInterrupt[] = "Critical Interrupt";
+constexpr char kButton[] = "Button";
+constexpr char kModuleBoard[] = "Module/Board";
+constexpr char kMicrocontroller[] = "Microcontroller/Coprocessor";
+constexpr char kChassis[] = "Chassis";
+constexpr char kChipSet[] = "Chip Set";
+constexpr char kOtherFru[] = "Other FRU";
+constexpr char kTerminator[] = "Terminator";
+constexpr char kSystemBootInitiated[] = "System Boot Initiated";
+constexpr char kBootError[] = "Boot Error";
+constexpr char kOsBoot[] = "OS Boot";
+constexpr char kOsStopShutdown[] = "OS Stop/Shutdown";
+constexpr char kSlotConnector[] = "Slot/Connector";
+constexpr char kSystemAcpiPowerState[] = "System ACPI Power State";
+constexpr char kWatchdog2[] = "Watchdog 2";
+constexpr char kPlatformAlert[] = "Platform Alert";
+constexpr char kEntityPresence[] = "Entity Presence";
+constexpr char kMonitorAsic[] = "Monitor ASIC/IC";
+constexpr char kLan[] = "LAN";
+constexpr char kManagementSubsystemHealth[] = "Management Subsystem Health";
+constexpr char kBattery[] = "Battery";
+constexpr char kVersionChange[] = "Version Change";
+constexpr char kFruState[] = "FRU State";
+constexpr char kFruHotSwap[] = "FRU Hot Swap";
+constexpr char kIpmb0Status[] = "IPMB-0 Status";
+constexpr char kModuleHotSwap[] = "Module Hot Swap";
+
+// The boot stages that System Firmware Hang and Progress events name in event data 3.
+constexpr char kFwUnspecified[] = "Unspecified";
+constexpr char kFwMemoryInit[] = "Memory initialization";
+constexpr char kFwHardDiskInit[] = "Hard-disk initialization";
+constexpr char kFwSecondaryCpuInit[] = "Secondary CPU Initialization";
+constexpr char kFwUserAuthentication[] = "User authentication";
+constexpr char kFwUserSetup[] = "User-initiated system setup";
+constexpr char kFwUsbConfig[] = "USB resource configuration";
+constexpr char kFwPciConfig[] = "PCI resource configuration";
+constexpr char kFwOptionRomInit[] = "Option ROM initialization";
+constexpr char kFwVideoInit[] = "Video initialization";
+constexpr char kFwCacheInit[] = "Cache initialization";
+constexpr char kFwSmbusInit[] = "SMBus initialization";
+constexpr char kFwKeyboardControllerInit[] = "Keyboard controller initialization";
+constexpr char kFwManagementControllerInit[] = "Management controller initialization";
+constexpr char kFwDockingAttachment[] = "Docking station attachment";
+constexpr char kFwEnablingDocking[] = "Enabling docking station";
+constexpr char kFwDockingEjection[] = "Docking station ejection";
+constexpr char kFwDisablingDocking[] = "Disabling docking station";
+constexpr char kFwWakeUpVector[] = "Calling operating system wake-up vector";
+constexpr char kFwBootInitiated[] = "System boot initiated";
+constexpr char kFwMotherboardInit[] = "Motherboard initialization";
+constexpr char kReserved[] = "reserved";  // also the unused watchdog actions
+constexpr char kFwFloppyInit[] = "Floppy initialization";
+constexpr char kFwKeyboardTest[] = "Keyboard test";
+constexpr char kFwPointingDeviceTest[] = "Pointing device test";
+constexpr char kFwPrimaryCpuInit[] = "Primary CPU initialization";
+
+constexpr ipmi_sel_row generic(uint8_t eventType, uint8_t offset, const char* group, const char* desc) {
+    return {selKey(SEL_KEY_GENERIC, eventType, offset, SEL_KEY_ANY_DATA3), 0, group, desc};
+}
+
+// A sensor-specific offset whose text does not depend on event data 3.
+constexpr ipmi_sel_row specific(uint8_t sensorType, uint8_t data1, const char* group,
+                                const char* desc) {
+    return {selKey(SEL_KEY_SPECIFIC, sensorType, data1, SEL_KEY_ANY_DATA3), 0, group, desc};
+}
+
+// A sensor type without defined offsets: one row that names the type.
+constexpr ipmi_sel_row typeOnly(uint8_t sensorType, const char* group) {
+    return specific(sensorType, 0x00, group, nullptr);
+}
+
+constexpr ipmi_sel_row specificByData3(uint8_t sensorType, uint8_t data1, uint8_t data3,
+                                       const char* group, const char* desc) {
+    return {selKey(SEL_KEY_SPECIFIC, sensorType, data1, data3), 0, group, desc};
+}
+
+}  // namespace
+
+constexpr ipmi_sel_row ipmi_sel_data[IPMI_SEL_DATA_ROWS] = {
+    // The "going low" texts end in a blank; callers have always shown them so.
+    generic(0x01, 0x00, kThreshold, "Lower Non-critical going low "),
+    generic(0x01, 0x01, kThreshold, "Lower Non-critical going high"),
+    generic(0x01, 0x02, kThreshold, "Lower Critical going low "),
+    generic(0x01, 0x03, kThreshold, "Lower Critical going high"),
+    generic(0x01, 0x04, kThreshold, "Lower Non-recoverable going low "),
+    generic(0x01, 0x05, kThreshold, "Lower Non-recoverable going high"),
+    generic(0x01, 0x06, kThreshold, "Upper Non-critical going low "),
+    generic(0x01, 0x07, kThreshold, "Upper Non-critical going high"),
+    generic(0x01, 0x08, kThreshold, "Upper Critical going low "),
+    generic(0x01, 0x09, kThreshold, "Upper Critical going high"),
+    generic(0x01, 0x0A, kThreshold, "Upper Non-recoverable going low "),
+    generic(0x01, 0x0B, kThreshold, "Upper Non-recoverable going high"),
+    generic(0x02, 0x00, kUsageState, "Transition to Idle"),
+    generic(0x02, 0x01, kUsageState, "Transition to Active"),
+    generic(0x02, 0x02, kUsageState, "Transition to Busy"),
+    generic(0x03, 0x00, kDigitalState, "State Deasserted"),
+    generic(0x03, 0x01, kDigitalState, "State Asserted"),
+    generic(0x04, 0x00, kDigitalState, "Predictive Failure Deasserted"),
+    generic(0x04, 0x01, kDigitalState, "Predictive Failure Asserted"),
+    generic(0x05, 0x00, kDigitalState, "Limit Not Exceeded"),
+    generic(0x05, 0x01, kDigitalState, "Limit Exceeded"),
+    generic(0x06, 0x00, kDigitalState, "Performance Met"),
+    generic(0x06, 0x01, kDigitalState, "Performance Lags"),
+    generic(0x07, 0x00, kSeverityState, "Transition to OK"),
+    generic(0x07, 0x01, kSeverityState, "Transition to Non-critical from OK"),
+    generic(0x07, 0x02, kSeverityState, "Transition to Critical from less severe"),
+    generic(0x07, 0x03, kSeverityState, "Transition to Non-recoverable from less severe"),
+    generic(0x07, 0x04, kSeverityState, "Transition to Non-critical from more severe"),
+    generic(0x07, 0x05, kSeverityState, "Transition to Critical from Non-recoverable"),
+    generic(0x07, 0x06, kSeverityState, "Transition to Non-recoverable"),
+    generic(0x07, 0x07, kSeverityState, "Monitor"),
+    generic(0x07, 0x08, kSeverityState, "Informational"),
+    generic(0x08, 0x00, kAvailabilityState, "Device Absent"),
+    generic(0x08, 0x01, kAvailabilityState, "Device Present"),
+    generic(0x09, 0x00, kAvailabilityState, "Device Disabled"),
+    generic(0x09, 0x01, kAvailabilityState, "Device Enabled"),
+    generic(0x0A, 0x00, kAvailabilityState, "Transition to Running"),
+    generic(0x0A, 0x01, kAvailabilityState, "Transition to In Test"),
+    generic(0x0A, 0x02, kAvailabilityState, "Transition to Power Off"),
+    generic(0x0A, 0x03, kAvailabilityState, "Transition to On Line"),
+    generic(0x0A, 0x04, kAvailabilityState, "Transition to Off Line"),
+    generic(0x0A, 0x05, kAvailabilityState, "Transition to Off Duty"),
+    generic(0x0A, 0x06, kAvailabilityState, "Transition to Degraded"),
+    generic(0x0A, 0x07, kAvailabilityState, "Transition to Power Save"),
+    generic(0x0A, 0x08, kAvailabilityState, "Install Error"),
+    generic(0x0B, 0x00, kRedundancyState, "Fully Redundant"),
+    generic(0x0B, 0x01, kRedundancyState, "Redundancy Lost"),
+    generic(0x0B, 0x02, kRedundancyState, "Redundancy Degraded"),
+    generic(0x0B, 0x03, kRedundancyState, "Non-Redundant: Sufficient from Redundant"),
+    generic(0x0B, 0x04, kRedundancyState, "Non-Redundant: Sufficient from Insufficient"),
+    generic(0x0B, 0x05, kRedundancyState, "Non-Redundant: Insufficient Resources"),
+    generic(0x0B, 0x06, kRedundancyState, "Redundancy Degraded from Fully Redundant"),
+    generic(0x0B, 0x07, kRedundancyState, "Redundancy Degraded from Non-Redundant"),
+    generic(0x0C, 0x00, kAcpiDevicePowerState, "D0 Power State"),
+    generic(0x0C, 0x01, kAcpiDevicePowerState, "D1 Power State"),
+    generic(0x0C, 0x02, kAcpiDevicePowerState, "D2 Power State"),
+    generic(0x0C, 0x03, kAcpiDevicePowerState, "D3 Power State"),
+    // Never reached by SEL decoding (generic lookups stop at type 0x0C), kept for
+    // the sensors' state names.
+    generic(0x17, 0x00, kAddInCard, "Add-in Card"),
+    generic(0x17, 0x01, kAddInCard, "Add-in Card"),
+    generic(0x1B, 0x00, kCableInterconnect, "Connected"),
+    generic(0x1B, 0x01, kCableInterconnect, "Config Error"),
+
+    typeOnly(0x01, kTemperature),
+    typeOnly(0x02, kVoltage),
+    typeOnly(0x03, kCurrent),
+    typeOnly(0x04, kFan),
+    specific(0x05, 0x00, kPhysicalSecurity, "General Chassis intrusion"),
+    specific(0x05, 0x01, kPhysicalSecurity, "Drive Bay intrusion"),
+    specific(0x05, 0x02, kPhysicalSecurity, "I/O Card area intrusion"),
+    specific(0x05, 0x03, kPhysicalSecurity, "Processor area intrusion"),
+    specific(0x05, 0x04, kPhysicalSecurity, "System unplugged from LAN"),
+    specific(0x05, 0x05, kPhysicalSecurity, "Unauthorized dock"),
+    specific(0x05, 0x06, kPhysicalSecurity, "FAN area intrusion"),
+    specific(0x06, 0x00, kPlatformSecurity, "Front Panel Lockout violation attempted"),
+    specific(0x06, 0x01, kPlatformSecurity, "Pre-boot password violation - user password"),
+    specific(0x06, 0x02, kPlatformSecurity, "Pre-boot password violation - setup password"),
+    specific(0x06, 0x03, kPlatformSecurity, "Pre-boot password violation - network boot password"),
+    specific(0x06, 0x04, kPlatformSecurity, "Other pre-boot password violation"),
+    specific(0x06, 0x05, kPlatformSecurity, "Out-of-band access password violation"),
+    specific(0x07, 0x00, kProcessor, "IERR"),
+    specific(0x07, 0x01, kProcessor, "Thermal Trip"),
+    specific(0x07, 0x02, kProcessor, "FRB1/BIST failure"),
+    specific(0x07, 0x03, kProcessor, "FRB2/Hang in POST failure"),
+    specific(0x07, 0x04, kProcessor, "FRB3/Processor startup/init failure"),
+    specific(0x07, 0x05, kProcessor, "Configuration Error"),
+    specific(0x07, 0x06, kProcessor, "SM BIOS Uncorrectable CPU-complex Error"),
+    specific(0x07, 0x07, kProcessor, "Presence detected"),
+    specific(0x07, 0x08, kProcessor, "Disabled"),
+    specific(0x07, 0x09, kProcessor, "Terminator presence detected"),
+    specific(0x07, 0x0A, kProcessor, "Throttled"),
+    specific(0x08, 0x00, kPowerSupply, "Presence detected"),
+    specific(0x08, 0x01, kPowerSupply, "Failure status"),
+    specific(0x08, 0x02, kPowerSupply, "Predictive failure"),
+    specific(0x08, 0x03, kPowerSupply, "Power Supply AC lost"),
+    specific(0x08, 0x04, kPowerSupply, "AC lost or out-of-range"),
+    specific(0x08, 0x05, kPowerSupply, "AC out-of-range, but present"),
+    specificByData3(0x08, 0x06, 0x00, kPowerSupply, "Config Error: Vendor Mismatch"),
+    specificByData3(0x08, 0x06, 0x01, kPowerSupply, "Config Error: Revision Mismatch"),
+    specificByData3(0x08, 0x06, 0x02, kPowerSupply, "Config Error: Processor Missing"),
+    specific(0x08, 0x06, kPowerSupply, "Config Error"),
+    specific(0x09, 0x00, kPowerUnit, "Power off/down"),
+    specific(0x09, 0x01, kPowerUnit, "Power cycle"),
+    specific(0x09, 0x02, kPowerUnit, "240VA power down"),
+    specific(0x09, 0x03, kPowerUnit, "Interlock power down"),
+    specific(0x09, 0x04, kPowerUnit, "AC lost"),
+    specific(0x09, 0x05, kPowerUnit, "Soft-power control failure"),
+    specific(0x09, 0x06, kPowerUnit, "Failure detected"),
+    specific(0x09, 0x07, kPowerUnit, "Predictive failure"),
+    typeOnly(0x0A, kCoolingDevice),
+    typeOnly(0x0B, kOtherUnitsBasedSensor),
+    specific(0x0C, 0x00, kMemory, "Correctable ECC"),
+    specific(0x0C, 0x01, kMemory, "Uncorrectable ECC"),
+    specific(0x0C, 0x02, kMemory, "Parity"),
+    specific(0x0C, 0x03, kMemory, "Memory Scrub Failed"),
+    specific(0x0C, 0x04, kMemory, "Memory Device Disabled"),
+    specific(0x0C, 0x05, kMemory, "Correctable ECC logging limit reached"),
+    specific(0x0C, 0x06, kMemory, "Presence Detected"),
+    specific(0x0C, 0x07, kMemory, "Configuration Error"),
+    specific(0x0C, 0x08, kMemory, "Spare"),
+    specific(0x0C, 0x09, kMemory, "Throttled"),
+    specific(0x0D, 0x00, kDriveSlot, "Drive Present"),
+    specific(0x0D, 0x01, kDriveSlot, "Drive Fault"),
+    specific(0x0D, 0x02, kDriveSlot, "Predictive Failure"),
+    specific(0x0D, 0x03, kDriveSlot, "Hot Spare"),
+    specific(0x0D, 0x04, kDriveSlot, "Parity Check In Progress"),
+    specific(0x0D, 0x05, kDriveSlot, "In Critical Array"),
+    specific(0x0D, 0x06, kDriveSlot, "In Failed Array"),
+    specific(0x0D, 0x07, kDriveSlot, "Rebuild In Progress"),
+    specific(0x0D, 0x08, kDriveSlot, "Rebuild Aborted"),
+    typeOnly(0x0E, kPostMemoryResize),
+    // System firmware events name their error, hang or progress code in event
+    // data 3 (not event data 2), so that byte selects the text.
+    specificByData3(0x0F, 0x00, 0x00, kSystemFirmwareError, kFwUnspecified),
+    specificByData3(0x0F, 0x00, 0x01, kSystemFirmwareError, "No system memory installed"),
+    specificByData3(0x0F, 0x00, 0x02, kSystemFirmwareError, "No usable system memory"),
+    specificByData3(0x0F, 0x00, 0x03, kSystemFirmwareError, "Unrecoverable IDE device failure"),
+    specificByData3(0x0F, 0x00, 0x04, kSystemFirmwareError, "Unrecoverable system-board failure"),
+    specificByData3(0x0F, 0x00, 0x05, kSystemFirmwareError, "Unrecoverable diskette failure"),
+    specificByData3(0x0F, 0x00, 0x06, kSystemFirmwareError,
+                    "Unrecoverable hard-disk controller failure"),
+    specificByData3(0x0F, 0x00, 0x07, kSystemFirmwareError,
+                    "Unrecoverable PS/2 or USB keyboard failure"),
+    specificByData3(0x0F, 0x00, 0x08, kSystemFirmwareError, "Removable boot media not found"),
+    specificByData3(0x0F, 0x00, 0x09, kSystemFirmwareError,
+                    "Unrecoverable video controller failure"),
+    specificByData3(0x0F, 0x00, 0x0A, kSystemFirmwareError, "No video device selected"),
+    specificByData3(0x0F, 0x00, 0x0B, kSystemFirmwareError, "BIOS corruption detected"),
+    specificByData3(0x0F, 0x00, 0x0C, kSystemFirmwareError, "CPU voltage mismatch"),
+    specificByData3(0x0F, 0x00, 0x0D, kSystemFirmwareError, "CPU speed mismatch failure"),
+    specific(0x0F, 0x00, kSystemFirmwareError, "Unknown Error"),
+    specificByData3(0x0F, 0x01, 0x00, kSystemFirmwareHang, kFwUnspecified),
+    specificByData3(0x0F, 0x01, 0x01, kSystemFirmwareHang, kFwMemoryInit),
+    specificByData3(0x0F, 0x01, 0x02, kSystemFirmwareHang, kFwHardDiskInit),
+    specificByData3(0x0F, 0x01, 0x03, kSystemFirmwareHang, kFwSecondaryCpuInit),
+    specificByData3(0x0F, 0x01, 0x04, kSystemFirmwareHang, kFwUserAuthentication),
+    specificByData3(0x0F, 0x01, 0x05, kSystemFirmwareHang, kFwUserSetup),
+    specificByData3(0x0F, 0x01, 0x06, kSystemFirmwareHang, kFwUsbConfig),
+    specificByData3(0x0F, 0x01, 0x07, kSystemFirmwareHang, kFwPciConfig),
+    specificByData3(0x0F, 0x01, 0x08, kSystemFirmwareHang, kFwOptionRomInit),
+    specificByData3(0x0F, 0x01, 0x09, kSystemFirmwareHang, kFwVideoInit),
+    specificByData3(0x0F, 0x01, 0x0A, kSystemFirmwareHang, kFwCacheInit),
+    specificByData3(0x0F, 0x01, 0x0B, kSystemFirmwareHang, kFwSmbusInit),
+    specificByData3(0x0F, 0x01, 0x0C, kSystemFirmwareHang, kFwKeyboardControllerInit),
+    specificByData3(0x0F, 0x01, 0x0D, kSystemFirmwareHang, kFwManagementControllerInit),
+    specificByData3(0x0F, 0x01, 0x0E, kSystemFirmwareHang, kFwDockingAttachment),
+    specificByData3(0x0F, 0x01, 0x0F, kSystemFirmwareHang, kFwEnablingDocking),
+    specificByData3(0x0F, 0x01, 0x10, kSystemFirmwareHang, kFwDockingEjection),
+    specificByData3(0x0F, 0x01, 0x11, kSystemFirmwareHang, kFwDisablingDocking),
+    specificByData3(0x0F, 0x01, 0x12, kSystemFirmwareHang, kFwWakeUpVector),
+    specificByData3(0x0F, 0x01, 0x13, kSystemFirmwareHang, kFwBootInitiated),
+    specificByData3(0x0F, 0x01, 0x14, kSystemFirmwareHang, kFwMotherboardInit),
+    specificByData3(0x0F, 0x01, 0x15, kSystemFirmwareHang, kReserved),
+    specificByData3(0x0F, 0x01, 0x16, kSystemFirmwareHang, kFwFloppyInit),
+    specificByData3(0x0F, 0x01, 0x17, kSystemFirmwareHang, kFwKeyboardTest),
+    specificByData3(0x0F, 0x01, 0x18, kSystemFirmwareHang, kFwPointingDeviceTest),
+    specificByData3(0x0F, 0x01, 0x19, kSystemFirmwareHang, kFwPrimaryCpuInit),
+    specific(0x0F, 0x01, kSystemFirmwareHang, "Unknown Hang"),
+    specificByData3(0x0F, 0x02, 0x00, kSystemFirmwareProgress, kFwUnspecified),
+    specificByData3(0x0F, 0x02, 0x01, kSystemFirmwareProgress, kFwMemoryInit),
+    specificByData3(0x0F, 0x02, 0x02, kSystemFirmwareProgress, kFwHardDiskInit),
+    specificByData3(0x0F, 0x02, 0x03, kSystemFirmwareProgress, kFwSecondaryCpuInit),
+    specificByData3(0x0F, 0x02, 0x04, kSystemFirmwareProgress, kFwUserAuthentication),
+    specificByData3(0x0F, 0x02, 0x05, kSystemFirmwareProgress, kFwUserSetup),
+    specificByData3(0x0F, 0x02, 0x06, kSystemFirmwareProgress, kFwUsbConfig),
+    specificByData3(0x0F, 0x02, 0x07, kSystemFirmwareProgress, kFwPciConfig),
+    specificByData3(0x0F, 0x02, 0x08, kSystemFirmwareProgress, kFwOptionRomInit),
+    specificByData3(0x0F, 0x02, 0x09, kSystemFirmwareProgress, kFwVideoInit),
+    specificByData3(0x0F, 0x02, 0x0A, kSystemFirmwareProgress, kFwCacheInit),
+    specificByData3(0x0F, 0x02, 0x0B, kSystemFirmwareProgress, kFwSmbusInit),
+    specificByData3(0x0F, 0x02, 0x0C, kSystemFirmwareProgress, kFwKeyboardControllerInit),
+    specificByData3(0x0F, 0x02, 0x0D, kSystemFirmwareProgress, kFwManagementControllerInit),
+    specificByData3(0x0F, 0x02, 0x0E, kSystemFirmwareProgress, kFwDockingAttachment),
+    specificByData3(0x0F, 0x02, 0x0F, kSystemFirmwareProgress, kFwEnablingDocking),
+    specificByData3(0x0F, 0x02, 0x10, kSystemFirmwareProgress, kFwDockingEjection),
+    specificByData3(0x0F, 0x02, 0x11, kSystemFirmwareProgress, kFwDisablingDocking),
+    specificByData3(0x0F, 0x02, 0x12, kSystemFirmwareProgress, kFwWakeUpVector),
+    specificByData3(0x0F, 0x02, 0x13, kSystemFirmwareProgress, kFwBootInitiated),
+    specificByData3(0x0F, 0x02, 0x14, kSystemFirmwareProgress, kFwMotherboardInit),
+    specificByData3(0x0F, 0x02, 0x15, kSystemFirmwareProgress, kReserved),
+    specificByData3(0x0F, 0x02, 0x16, kSystemFirmwareProgress, kFwFloppyInit),
+    specificByData3(0x0F, 0x02, 0x17, kSystemFirmwareProgress, kFwKeyboardTest),
+    specificByData3(0x0F, 0x02, 0x18, kSystemFirmwareProgress, kFwPointingDeviceTest),
+    specificByData3(0x0F, 0x02, 0x19, kSystemFirmwareProgress, kFwPrimaryCpuInit),
+    specific(0x0F, 0x02, kSystemFirmwareProgress, "Unknown Progress"),
+    specific(0x10, 0x00, kEventLoggingDisabled, "Correctable memory error logging disabled"),
+    specific(0x10, 0x01, kEventLoggingDisabled, "Event logging disabled"),
+    specific(0x10, 0x02, kEventLoggingDisabled, "Log area reset/cleared"),
+    specific(0x10, 0x03, kEventLoggingDisabled, "All event logging disabled"),
+    specific(0x10, 0x04, kEventLoggingDisabled, "Log full"),
+    specific(0x10, 0x05, kEventLoggingDisabled, "Log almost full"),
+    specific(0x11, 0x00, kWatchdog1, "BIOS Reset"),
+    specific(0x11, 0x01, kWatchdog1, "OS Reset"),
+    specific(0x11, 0x02, kWatchdog1, "OS Shut Down"),
+    specific(0x11, 0x03, kWatchdog1, "OS Power Down"),
+    specific(0x11, 0x04, kWatchdog1, "OS Power Cycle"),
+    specific(0x11, 0x05, kWatchdog1, "OS NMI/Diag Interrupt"),
+    specific(0x11, 0x06, kWatchdog1, "OS Expired"),
+    specific(0x11, 0x07, kWatchdog1, "OS pre-timeout Interrupt"),
+    specific(0x12, 0x00, kSystemEvent, "System Reconfigured"),
+    specific(0x12, 0x01, kSystemEvent, "OEM System boot event"),
+    specific(0x12, 0x02, kSystemEvent, "Undetermined system hardware failure"),
+    specific(0x12, 0x03, kSystemEvent, "Entry added to auxiliary log"),
+    specific(0x12, 0x04, kSystemEvent, "PEF Action"),
+    specific(0x12, 0x05, kSystemEvent, "Timestamp Clock Sync"),
+    specific(0x13, 0x00, kCriticalInterrupt, "NMI/Diag Interrupt"),
+    specific(0x13, 0x01, kCriticalInterrupt, "Bus Timeout"),
+    specific(0x13, 0x02, kCriticalInterrupt, "I/O Channel check NMI"),
+    specific(0x13, 0x03, kCriticalInterrupt, "Software NMI"),
+    specific(0x13, 0x04, kCriticalInterrupt, "PCI PERR"),
+    specific(0x13, 0x05, kCriticalInterrupt, "PCI SERR"),
+    specific(0x13, 0x06, kCriticalInterrupt, "EISA failsafe timeout"),
+    specific(0x13, 0x07, kCriticalInterrupt, "Bus Correctable error"),
+    specific(0x13, 0x08, kCriticalInterrupt, "Bus Uncorrectable error"),
+    specific(0x13, 0x09, kCriticalInterrupt, "Fatal NMI"),
+    specific(0x13, 0x0A, kCriticalInterrupt, "Bus Fatal Error"),
+    specific(0x14, 0x00, kButton, "Power Button pressed"),
+    specific(0x14, 0x01, kButton, "Sleep Button pressed"),
+    specific(0x14, 0x02, kButton, "Reset Button pressed"),
+    specific(0x14, 0x03, kButton, "FRU Latch"),
+    specific(0x14, 0x04, kButton, "FRU Service"),
+    typeOnly(0x15, kModuleBoard),
+    typeOnly(0x16, kMicrocontroller),
+    typeOnly(0x17, kAddInCard),
+    typeOnly(0x18, kChassis),
+    typeOnly(0x19, kChipSet),
+    typeOnly(0x1A, kOtherFru),
+    specific(0x1B, 0x00, kCableInterconnect, "Connected"),
+    specific(0x1B, 0x01, kCableInterconnect, "Config Error"),
+    typeOnly(0x1C, kTerminator),
+    specific(0x1D, 0x00, kSystemBootInitiated, "Initiated by power up"),
+    specific(0x1D, 0x01, kSystemBootInitiated, "Initiated by hard reset"),
+    specific(0x1D, 0x02, kSystemBootInitiated, "Initiated by warm reset"),
+    specific(0x1D, 0x03, kSystemBootInitiated, "User requested PXE boot"),
+    specific(0x1D, 0x04, kSystemBootInitiated, "Automatic boot to diagnostic"),
+    specific(0x1D, 0x05, kSystemBootInitiated, "OS initiated hard reset"),
+    specific(0x1D, 0x06, kSystemBootInitiated, "OS initiated warm reset"),
+    specific(0x1D, 0x07, kSystemBootInitiated, "System Restart"),
+    specific(0x1E, 0x00, kBootError, "No bootable media"),
+    specific(0x1E, 0x01, kBootError, "Non-bootable disk in drive"),
+    specific(0x1E, 0x02, kBootError, "PXE server not found"),
+    specific(0x1E, 0x03, kBootError, "Invalid boot sector"),
+    specific(0x1E, 0x04, kBootError, "Timeout waiting for selection"),
+    specific(0x1F, 0x00, kOsBoot, "A: boot completed"),
+    specific(0x1F, 0x01, kOsBoot, "C: boot completed"),
+    specific(0x1F, 0x02, kOsBoot, "PXE boot completed"),
+    specific(0x1F, 0x03, kOsBoot, "Diagnostic boot completed"),
+    specific(0x1F, 0x04, kOsBoot, "CD-ROM boot completed"),
+    specific(0x1F, 0x05, kOsBoot, "ROM boot completed"),
+    specific(0x1F, 0x06, kOsBoot, "boot completed - device not specified"),
+    specific(0x20, 0x00, kOsStopShutdown, "Error during system startup"),
+    specific(0x20, 0x01, kOsStopShutdown, "Run-time critical stop"),
+    specific(0x20, 0x02, kOsStopShutdown, "OS graceful stop"),
+    specific(0x20, 0x03, kOsStopShutdown, "OS graceful shutdown"),
+    specific(0x20, 0x04, kOsStopShutdown, "PEF initiated soft shutdown"),
+    specific(0x20, 0x05, kOsStopShutdown, "Agent not responding"),
+    specific(0x21, 0x00, kSlotConnector, "Fault Status"),
+    specific(0x21, 0x01, kSlotConnector, "Identify Status"),
+    specific(0x21, 0x02, kSlotConnector, "Device Installed"),
+    specific(0x21, 0x03, kSlotConnector, "Ready for Device Installation"),
+    specific(0x21, 0x04, kSlotConnector, "Ready for Device Removal"),
+    specific(0x21, 0x05, kSlotConnector, "Slot Power is Off"),
+    specific(0x21, 0x06, kSlotConnector, "Device Removal Request"),
+    specific(0x21, 0x07, kSlotConnector, "Interlock"),
+    specific(0x21, 0x08, kSlotConnector, "Slot is Disabled"),
+    specific(0x21, 0x09, kSlotConnector, "Spare Device"),
+    specific(0x22, 0x00, kSystemAcpiPowerState, "S0/G0: working"),
+    specific(0x22, 0x01, kSystemAcpiPowerState,
+             "S1: sleeping with system hw & processor context maintained"),
+    specific(0x22, 0x02, kSystemAcpiPowerState, "S2: sleeping, processor context lost"),
+    specific(0x22, 0x03, kSystemAcpiPowerState,
+             "S3: sleeping, processor & hw context lost, memory retained"),
+    specific(0x22, 0x04, kSystemAcpiPowerState, "S4: non-volatile sleep/suspend-to-disk"),
+    specific(0x22, 0x05, kSystemAcpiPowerState, "S5/G2: soft-off"),
+    specific(0x22, 0x06, kSystemAcpiPowerState, "S4/S5: soft-off"),
+    specific(0x22, 0x07, kSystemAcpiPowerState, "G3: mechanical off"),
+    specific(0x22, 0x08, kSystemAcpiPowerState, "Sleeping in S1/S2/S3 state"),
+    specific(0x22, 0x09, kSystemAcpiPowerState, "G1: sleeping"),
+    specific(0x22, 0x0A, kSystemAcpiPowerState, "S5: entered by override"),
+    specific(0x22, 0x0B, kSystemAcpiPowerState, "Legacy ON state"),
+    specific(0x22, 0x0C, kSystemAcpiPowerState, "Legacy OFF state"),
+    specific(0x22, 0x0E, kSystemAcpiPowerState, "Unknown"),
+    specific(0x23, 0x00, kWatchdog2, "Timer expired"),
+    specific(0x23, 0x01, kWatchdog2, "Hard reset"),
+    specific(0x23, 0x02, kWatchdog2, "Power down"),
+    specific(0x23, 0x03, kWatchdog2, "Power cycle"),
+    specific(0x23, 0x04, kWatchdog2, kReserved),
+    specific(0x23, 0x05, kWatchdog2, kReserved),
+    specific(0x23, 0x06, kWatchdog2, kReserved),
+    specific(0x23, 0x07, kWatchdog2, kReserved),
+    specific(0x23, 0x08, kWatchdog2, "Timer interrupt"),
+    specific(0x24, 0x00, kPlatformAlert, "Platform generated page"),
+    specific(0x24, 0x01, kPlatformAlert, "Platform generated LAN alert"),
+    specific(0x24, 0x02, kPlatformAlert, "Platform Event Trap generated"),
+    specific(0x24, 0x03, kPlatformAlert, "Platform generated SNMP trap, OEM format"),
+    specific(0x25, 0x00, kEntityPresence, "Present"),
+    specific(0x25, 0x01, kEntityPresence, "Absent"),
+    specific(0x25, 0x02, kEntityPresence, "Disabled"),
+    typeOnly(0x26, kMonitorAsic),
+    specific(0x27, 0x00, kLan, "Heartbeat Lost"),
+    specific(0x27, 0x01, kLan, "Heartbeat"),
+    specific(0x28, 0x00, kManagementSubsystemHealth, "Sensor access degraded or unavailable"),
+    specific(0x28, 0x01, kManagementSubsystemHealth, "Controller access degraded or unavailable"),
+    specific(0x28, 0x02, kManagementSubsystemHealth, "Management controller off-line"),
+    specific(0x28, 0x03, kManagementSubsystemHealth, "Management controller unavailable"),
+    specific(0x28, 0x04, kManagementSubsystemHealth, "Sensor failure"),
+    specific(0x28, 0x05, kManagementSubsystemHealth, "FRU failure"),
+    specific(0x29, 0x00, kBattery, "Low"),
+    specific(0x29, 0x01, kBattery, "Failed"),
+    specific(0x29, 0x02, kBattery, "Presence Detected"),
+    specific(0x2B, 0x00, kVersionChange, "Hardware change detected"),
+    specific(0x2B, 0x01, kVersionChange, "Firmware or software change detected"),
+    specific(0x2B, 0x02, kVersionChange, "Hardware incompatibility detected"),
+    specific(0x2B, 0x03, kVersionChange, "Firmware or software incompatibility detected"),
+    specific(0x2B, 0x04, kVersionChange, "Invalid or unsupported hardware version"),
+    specific(0x2B, 0x05, kVersionChange, "Invalid or unsupported firmware or software version"),
+    specific(0x2B, 0x06, kVersionChange, "Hardware change success"),
+    specific(0x2B, 0x07, kVersionChange, "Firmware or software change success"),
+    specific(0x2C, 0x00, kFruState, "Not Installed"),
+    specific(0x2C, 0x01, kFruState, "Inactive"),
+    specific(0x2C, 0x02, kFruState, "Activation Requested"),
+    specific(0x2C, 0x03, kFruState, "Activation in Progress"),
+    specific(0x2C, 0x04, kFruState, "Active"),
+    specific(0x2C, 0x05, kFruState, "Deactivation Requested"),
+    specific(0x2C, 0x06, kFruState, "Deactivation in Progress"),
+    specific(0x2C, 0x07, kFruState, "Communication lost"),
+    specific(0xF0, 0x00, kFruHotSwap, "Transition to M0"),
+    specific(0xF0, 0x01, kFruHotSwap, "Transition to M1"),
+    specific(0xF0, 0x02, kFruHotSwap, "Transition to M2"),
+    specific(0xF0, 0x03, kFruHotSwap, "Transition to M3"),
+    specific(0xF0, 0x04, kFruHotSwap, "Transition to M4"),
+    specific(0xF0, 0x05, kFruHotSwap, "Transition to M5"),
+    specific(0xF0, 0x06, kFruHotSwap, "Transition to M6"),
+    specific(0xF0, 0x07, kFruHotSwap, "Transition to M7"),
+    specific(0xF1, 0x00, kIpmb0Status, "IPMB-A disabled, IPMB-B disabled"),
+    specific(0xF1, 0x01, kIpmb0Status, "IPMB-A enabled, IPMB-B disabled"),
+    specific(0xF1, 0x02, kIpmb0Status, "IPMB-A disabled, IPMB-B enabled"),
+    // "IPMP-B" is the text callers have always matched on.
+    specific(0xF1, 0x03, kIpmb0Status, "IPMB-A enabled, IPMP-B enabled"),
+    specific(0xF2, 0x00, kModuleHotSwap, "Module Handle Closed"),
+    specific(0xF2, 0x01, kModuleHotSwap, "Module Handle Opened"),
+    specific(0xF2, 0x02, kModuleHotSwap, "Quiesced"),
+};
+
+namespace {
+
+constexpr size_t kRows = IPMI_SEL_DATA_ROWS;
+
+// Strictly increasing keys also prove that no row was left zero-filled.
+constexpr bool rowsSortedByKey() {
+    for (size_t i = 1; i < kRows; ++i)
+        if (ipmi_sel_data[i - 1].key >= ipmi_sel_data[i].key) return false;
+    return true;
+}
+static_assert(rowsSortedByKey(), "ipmi_sel_data must be sorted by key, one row per key");
+
+// ---- Minimal perfect hash (hash and displace) ------------------------------
+
+constexpr uint32_t kHashPrime = 0x01000193;
+
+constexpr uint32_t hashKey(uint32_t seed, uint32_t key) {
+    uint32_t h = seed;
+    for (int shift = 24; shift >= 0; shift -= 8) h = (h * kHashPrime) ^ ((key >> shift) & 0xFF);
+    return h;
+}
+
+struct HashArrays {
+    int32_t g[kRows];
+    int32_t v[kRows];
+};
+
+constexpr uint32_t lookupRow(const int32_t (&g)[kRows], const int32_t (&v)[kRows], uint32_t key) {
+    int32_t d = g[hashKey(kHashPrime, key) % kRows];
+    if (d < 0) return uint32_t(v[-int64_t(d) - 1] - 1);
+    uint32_t seed = d == 0 ? kHashPrime : uint32_t(d);
+    return uint32_t(v[hashKey(seed, key) % kRows] - 1);
+}
+
+// Keys that share a first-level bucket get a displacement seed that sends each
+// of them to a free slot of its own (largest buckets first); a key alone in its
+// bucket takes a free slot directly, stored as -(slot + 1).
+constexpr HashArrays buildHashArrays() {
+    HashArrays a{};
+    uint32_t bucketOf[kRows] = {};
+    uint32_t bucketSize[kRows] = {};
+    bool taken[kRows] = {};
+    uint32_t largest = 0;
+    for (size_t i = 0; i < kRows; ++i) {
+        bucketOf[i] = hashKey(kHashPrime, ipmi_sel_data[i].key) % kRows;
+        uint32_t size = ++bucketSize[bucketOf[i]];
+        if (size > largest) largest = size;
+    }
+    for (uint32_t size = largest; size >= 2; --size) {
+        for (size_t bucket = 0; bucket < kRows; ++bucket) {
+            if (bucketSize[bucket] != size) continue;
+            uint32_t members[kRows] = {};
+            uint32_t count = 0;
+            for (size_t i = 0; i < kRows; ++i)
+                if (bucketOf[i] == bucket) members[count++] = uint32_t(i);
+            uint32_t slots[kRows] = {};
+            for (uint32_t seed = 1;; ++seed) {
+                uint32_t placed = 0;
+                for (; placed < count; ++placed) {
+                    uint32_t slot = hashKey(seed, ipmi_sel_data[members[placed]].key) % kRows;
+                    bool clash = taken[slot];
+                    for (uint32_t j = 0; j < placed && !clash; ++j) clash = slots[j] == slot;
+                    if (clash) break;
+                    slots[placed] = slot;
+                }
+                if (placed == count) {
+                    a.g[bucket] = int32_t(seed);
+                    break;
+                }
+            }
+            for (uint32_t j = 0; j < count; ++j) {
+                taken[slots[j]] = true;
+                a.v[slots[j]] = int32_t(members[j] + 1);
+            }
+        }
+    }
+    size_t freeSlot = kRows;
+    for (size_t i = 0; i < kRows; ++i) {
+        if (bucketSize[bucketOf[i]] != 1) continue;
+        while (taken[--freeSlot]) {
+        }
+        taken[freeSlot] = true;
+        a.g[bucketOf[i]] = -int32_t(freeSlot) - 1;
+        a.v[freeSlot] = int32_t(i + 1);
+    }
+    return a;
+}
+
+constexpr HashArrays kHash = buildHashArrays();
+
+constexpr bool everyKeyFindsItsRow() {
+    for (size_t i = 0; i < kRows; ++i)
+        if (lookupRow(kHash.g, kHash.v, ipmi_sel_data[i].key) != i) return false;
+    return true;
+}
+static_assert(everyKeyFindsItsRow(), "the hash must send every key to its own row");
+
+// ---- State name tables: the rows with a text, reshaped -----------------------
+
+constexpr size_t countTexts(uint32_t category) {
+    size_t n = 0;
+    for (const ipmi_sel_row& row : ipmi_sel_data)
+        if (selKeyCategory(row.key) == selKeyCategory(category) && row.desc) ++n;
+    return n;
+}
+
+template <size_t N>
+constexpr std::array<ipmi_event_type, N + 1> eventTypesOf(uint32_t category) {
+    std::array<ipmi_event_type, N + 1> out{};
+    size_t n = 0;
+    for (const ipmi_sel_row& row : ipmi_sel_data) {
+        if (selKeyCategory(row.key) != selKeyCategory(category) || !row.desc) continue;
+        out[n++] = {selKeyType(row.key), selKeyData1(row.key), selKeyData3(row.key), row.desc};
+    }
+    return out;  // the last row stays zero: no text ends the table
+}
+
+constexpr auto kGenericEventTypes = eventTypesOf<countTexts(SEL_KEY_GENERIC)>(SEL_KEY_GENERIC);
+constexpr auto kSpecificEventTypes = eventTypesOf<countTexts(SEL_KEY_SPECIFIC)>(SEL_KEY_SPECIFIC);
+
+// ---- SEL record description ------------------------------------------------
+
+constexpr char kNoDescription[] = "n/a";
+constexpr uint8_t kOldestDescribedEvmRev = 4;
+constexpr size_t kMessageBufferSize = 64;
+
+bool isEventRecord(uint8_t recordType) {
+    return recordType == 0x00 || recordType == SEL_RECORD_TYPE_SYSTEM_EVENT;
+}
+
+bool isGenericEventType(uint8_t eventType) {
+    return eventType >= EVENT_TYPE_THRESHOLD && eventType <= EVENT_TYPE_GENERIC_LAST;
+}
+
+const char* textOf(const ipmi_sel_row& row, uint32_t key) {
+    return row.key == key && row.desc ? row.desc : "";
+}
+
+void writeText(char* dst, int size, const char* text) {
+    if (dst && size > 0) snprintf(dst, size_t(size), "%s", text);
+}
+
+// The event's text as its event type selects it; null when the type has no table.
+const char* eventText(const Event_log& record) {
+    uint8_t eventType = record.event_dir_type & SEL_EVENT_TYPE_MASK;
+    if (isGenericEventType(eventType)) return find_generic_desc(eventType, record.event_data[0]);
+    if (eventType == EVENT_TYPE_SENSOR_SPECIFIC)
+        return find_specific_desc(record.sensor_type, record.event_data[0], record.event_data[2]);
+    return nullptr;
+}
+
+}  // namespace
+
+const int32_t (&G_array)[IPMI_SEL_DATA_ROWS] = kHash.g;
+const int32_t (&V_array)[IPMI_SEL_DATA_ROWS] = kHash.v;
+
+const ipmi_event_type* const generic_sensor_event_types = kGenericEventTypes.data();
+const ipmi_event_type* const sensor_specific_event_types = kSpecificEventTypes.data();
+
+uint32_t perfect_hash_lookup(uint32_t key) { return lookupRow(G_array, V_array, key); }
+
+const char* find_generic_desc(uint8_t eventType, uint8_t data1) {
+    uint32_t key = selKey(SEL_KEY_GENERIC, eventType, data1, SEL_KEY_ANY_DATA3);
+    return textOf(ipmi_sel_data[perfect_hash_lookup(key)], key);
+}
+
+const char* find_specific_desc(uint8_t sensorType, uint8_t data1, uint8_t data3) {
+    uint32_t key = selKey(SEL_KEY_SPECIFIC, sensorType, data1, data3);
+    return textOf(ipmi_sel_data[perfect_hash_lookup(key)], key);
+}
+
+int code_compare(const void* a, const void* b) {
+    uint32_t ka = static_cast<const ipmi_sel_row*>(a)->key;
+    uint32_t kb = static_cast<const ipmi_sel_row*>(b)->key;
+    if (selKeyCategory(ka) != selKeyCategory(kb)) return selKeyCategory(ka) < selKeyCategory(kb) ? -1 : 1;
+    if (selKeyType(ka) != selKeyType(kb)) return selKeyType(ka) < selKeyType(kb) ? -1 : 1;
+    return 0;
+}
+
+const char* find_sensor_type_name(uint8_t sensorType) {
+    ipmi_sel_row wanted = {selKey(SEL_KEY_SPECIFIC, sensorType, 0, 0), 0, nullptr, nullptr};
+    const void* found = bsearch(&wanted, ipmi_sel_data, kRows, sizeof(ipmi_sel_row), code_compare);
+    return found ? static_cast<const ipmi_sel_row*>(found)->group : nullptr;
+}
+
+void build_sel_desc(Event_log record, char* dst, int size) {
+    if (!isEventRecord(record.record_type)) {
+        ipmiLog(LOG_ERR, "%s: no description for SEL type=%d (support only %d)", __func__,
+                record.record_type, SEL_RECORD_TYPE_SYSTEM_EVENT);
+        writeText(dst, size, kNoDescription);
+    }
+    // Revision 4 passes although the message calls 4 the bound to exceed.
+    if (record.evm_rev < kOldestDescribedEvmRev) {
+        ipmiLog(LOG_ERR, "%s: no description for SEL with IPMI version is %d, expect > %d",
+                __func__, record.evm_rev, kOldestDescribedEvmRev);
+        writeText(dst, size, kNoDescription);
+        return;
+    }
+    const char* direction =
+        (record.event_dir_type & SEL_EVENT_DEASSERTION) ? "Deassert +" : "Assert +";
+    const char* name = find_sensor_type_name(record.sensor_type);
+    if (!name) name = "";
+    const char* text = eventText(record);
+    if (!dst || size <= 0) return;
+    if (text)
+        snprintf(dst, size_t(size), "%s %s %s", direction, name, text);
+    else
+        snprintf(dst, size_t(size), "%s %s", direction, name);
+}
+
+std::string GetMessage(Event_log record) {
+    const char* text = eventText(record);
+    if (!text) return kTextNotAvailable;
+    char message[kMessageBufferSize];
+    snprintf(message, sizeof message, "%s", text);
+    return message;
+}
+
+}  // namespace Ipmi

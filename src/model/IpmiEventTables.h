@@ -1,0 +1,83 @@
+#ifndef TAV_IPMI_IPMIEVENTTABLES_H
+#define TAV_IPMI_IPMIEVENTTABLES_H
+
+// Texts of IPMI events and sensor types, looked up by SEL decoding and by the
+// sensors' state names; not installed.
+
+#include <stdint.h>
+
+#include "IpmiSelData.h"
+
+namespace Ipmi {
+
+// Key layout of ipmi_sel_data: category, type, event data 1, event data 3
+// from the most significant byte down.
+enum : uint32_t {
+    SEL_KEY_GENERIC = 0x01000000,   // generic event/reading type offsets
+    SEL_KEY_SPECIFIC = 0x02000000,  // sensor-specific offsets, by sensor type
+    SEL_KEY_ANY_DATA3 = 0xFF        // text does not depend on event data 3
+};
+
+constexpr uint32_t selKey(uint32_t category, uint8_t type, uint8_t data1, uint8_t data3) {
+    return category | uint32_t(type) << 16 | uint32_t(data1) << 8 | data3;
+}
+constexpr uint8_t selKeyCategory(uint32_t key) { return uint8_t(key >> 24); }
+constexpr uint8_t selKeyType(uint32_t key) { return uint8_t(key >> 16); }
+constexpr uint8_t selKeyData1(uint32_t key) { return uint8_t(key >> 8); }
+constexpr uint8_t selKeyData3(uint32_t key) { return uint8_t(key); }
+
+// Event/reading type codes that have texts.
+enum : uint8_t {
+    EVENT_TYPE_THRESHOLD = 0x01,
+    EVENT_TYPE_GENERIC_LAST = 0x0C,  // generic types run from threshold to here
+    EVENT_TYPE_SENSOR_SPECIFIC = 0x6F
+};
+
+// What a state or message text reads when there is none.
+constexpr const char* kTextNotAvailable = "N/A";
+
+struct ipmi_sel_row {
+    uint32_t key;
+    uint32_t reserved;    // 0 in every row
+    const char* group;    // event/reading type name or sensor type name
+    const char* desc;     // null for a sensor type without offsets
+};
+
+enum { IPMI_SEL_DATA_ROWS = 352 };
+
+// Sorted by key.
+extern const ipmi_sel_row ipmi_sel_data[IPMI_SEL_DATA_ROWS];
+// Minimal perfect hash over the keys of ipmi_sel_data (hash and displace),
+// built from the table when the library is compiled.
+extern const int32_t (&G_array)[IPMI_SEL_DATA_ROWS];
+extern const int32_t (&V_array)[IPMI_SEL_DATA_ROWS];  // row number + 1
+
+// Row that `key` hashes to; the caller checks that the row holds the key.
+uint32_t perfect_hash_lookup(uint32_t key);
+
+// Event text, or "" when no row has the key or the row has no text.
+const char* find_generic_desc(uint8_t eventType, uint8_t data1);
+const char* find_specific_desc(uint8_t sensorType, uint8_t data1, uint8_t data3);
+
+// Orders rows by category and type only, for the sensor type name search.
+int code_compare(const void* a, const void* b);
+// Name of a sensor type from its sensor-specific rows; null when it has none.
+const char* find_sensor_type_name(uint8_t sensorType);
+
+// The discrete state names searched by IpmiSensor::convertToEnumeration: the
+// rows with a text of ipmi_sel_data, same order, same texts. `qualifier` is
+// the event data 3 value that selects the text (0xFF: any). Each table ends
+// with a row whose text is null.
+struct ipmi_event_type {
+    uint8_t code;       // event/reading type, or sensor type
+    uint8_t offset;     // event offset (event data 1)
+    uint8_t qualifier;
+    const char* text;
+};
+
+extern const ipmi_event_type* const generic_sensor_event_types;
+extern const ipmi_event_type* const sensor_specific_event_types;
+
+}  // namespace Ipmi
+
+#endif
