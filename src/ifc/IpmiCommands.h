@@ -28,6 +28,9 @@ constexpr uint8_t setSensorEventEnable = 0x28;
 constexpr uint8_t getSensorEventEnable = 0x29;
 constexpr uint8_t rearmSensorEvents = 0x2A;
 constexpr uint8_t getSensorReading = 0x2D;
+constexpr uint8_t getDeviceSdrInfo = 0x20;
+constexpr uint8_t getDeviceSdr = 0x21;
+constexpr uint8_t reserveDeviceSdrRepository = 0x22;
 // App
 constexpr uint8_t getDeviceId = 0x01;
 constexpr uint8_t getSelfTestResults = 0x04;

@@ -101,7 +101,8 @@ bool set_bmc_prop(const char* value, unsigned int length, unsigned char paramete
 extern int SKIP_SDR_STEP;
 extern int SKIP_FRU_STEP;
 
-// SDR repository.
+// SDR repository. sdr_mutex serialises the refresh chain of every node.
+extern TAV::Mutex sdr_mutex;
 uint32_t IpmiIfcRhGetSdrInfo(ipmiifc_resp* resp);
 uint32_t IpmiIfcSdrReserve(int node);
 uint32_t IpmiIfcSdrGetHeaders(int node);
