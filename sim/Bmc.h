@@ -81,6 +81,10 @@ void registerFruHandlers(Bmc& bmc);
 std::shared_ptr<Bmc> loadProfile(const std::string& path);
 // The project's own profile of a plausible server.
 std::string defaultProfilePath();
+// Appends the records of an `ipmitool sdr dump` file (whole records back to
+// back, 5-byte header + body) to the controller's SDR repository.
+// Throws std::runtime_error("file: message") when it cannot be read or is cut short.
+void loadSdrDump(Bmc& bmc, const std::string& path);
 
 }  // namespace Sim
 
