@@ -46,6 +46,12 @@ struct SensorModel {
     uint16_t assertEnables = 0;
     uint16_t deassertEnables = 0;
     uint8_t eventSupport = 0;  // SDR capability bits 1:0
+    // SDR capability bits 5:4: 0 none, 1 readable, 2 readable and settable, 3 fixed.
+    uint8_t hysteresisSupport = 2;
+    // What the last Re-arm Sensor Events asked for (all = both masks 0xFFFF).
+    unsigned rearmCount = 0;
+    uint16_t rearmedAssert = 0;
+    uint16_t rearmedDeassert = 0;
 };
 
 struct SelModel {
@@ -63,14 +69,31 @@ struct SelModel {
 
 struct LanChannelModel {
     uint8_t number = 1;
-    uint8_t medium = 4;  // 802.3 LAN
-    uint8_t protocol = 1;
+    uint8_t medium = 4;          // 802.3 LAN
+    uint8_t protocol = 1;        // IPMB-1.0, which LAN channels use
+    uint8_t sessionSupport = 0x80;  // multi-session
 };
+
+// One IPv6 static address (LAN parameter 0x38, one set selector each).
+struct LanIpv6StaticAddress {
+    uint8_t source = 0x80;  // bit 7: enabled; low nibble 0: static
+    uint8_t address[16] = {};
+    uint8_t prefixLength = 64;
+    uint8_t status = 0;  // 0 active
+};
+
+// LAN parameters a plain controller answers with: a static 192.168.1.10/24
+// behind gateway 192.168.1.1.
+std::map<uint8_t, std::vector<uint8_t>> defaultLanParameters();
 
 struct LanModel {
     std::vector<LanChannelModel> channels{LanChannelModel{}};
     // Parameter number -> parameter data (after the revision byte).
-    std::map<uint8_t, std::vector<uint8_t>> parameters;
+    std::map<uint8_t, std::vector<uint8_t>> parameters = defaultLanParameters();
+    // Parameter 0x38; empty: IPv6 not supported (0x80).
+    std::vector<LanIpv6StaticAddress> ipv6StaticAddresses;
+    // Firmware that answers LAN parameters asked on channel 0 as for its LAN channel.
+    bool answersOnChannelZero = false;
 };
 
 struct FruDeviceModel {
