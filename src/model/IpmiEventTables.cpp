@@ -11,6 +11,8 @@ namespace Ipmi {
 
 namespace {
 
+namespace st = sensorTypeName;
+
 // Names of the event/reading types and of the sensor types, as the rows carry them.
 constexpr char kThreshold[] = "Threshold";
 constexpr char kUsageState[] = "Usage State";
@@ -19,57 +21,35 @@ constexpr char kSeverityState[] = "Severity State";
 constexpr char kAvailabilityState[] = "Availability State";
 constexpr char kRedundancyState[] = "Redundancy State";
 constexpr char kAcpiDevicePowerState[] = "ACPI Device Power State";
-constexpr char kAddInCard[] = "Add-in Card";
 constexpr char kCableInterconnect[] = "Cable/Interconnect";
-constexpr char kTemperature[] = "Temperature";
-constexpr char kVoltage[] = "Voltage";
-constexpr char kCurrent[] = "Current";
-constexpr char kFan[] = "Fan";
-constexpr char kPhysicalSecurity[] = "Physical Security";
-constexpr char kPlatformSecurity[] = "Platform Security";
-constexpr char kProcessor[] = "Processor";
-constexpr char kPowerSupply[] = "Power Supply";
-constexpr char kPowerUnit[] = "Power Unit";
-constexpr char kCoolingDevice[] = "Cooling Device";
 constexpr char kOtherUnitsBasedSensor[] = "Other Units-based Sensor";
-constexpr char kMemory[] = "Memory";
 constexpr char kDriveSlot[] = "Drive Slot";
-constexpr char kPostMemoryResize[] = "POST Memory Resize";
 constexpr char kSystemFirmwareError[] = "System Firmware Error";
 constexpr char kSystemFirmwareHang[] = "System Firmware Hang";
 constexpr char kSystemFirmwareProgress[] = "System Firmware Progress";
-constexpr char kEventLoggingDisabled[] = "Event Logging Disabled";
 constexpr char kWatchdog1[] = "Watchdog 1";
-constexpr char kSystemEvent[] = "System Event";
-constexpr char kCriticalInterrupt[] = "Critical Interrupt";
-constexpr char kButton[] = "Button";
 constexpr char kModuleBoard[] = "Module/Board";
 constexpr char kMicrocontroller[] = "Microcontroller/Coprocessor";
-constexpr char kChassis[] = "Chassis";
-constexpr char kChipSet[] = "Chip Set";
-constexpr char kOtherFru[] = "Other FRU";
-constexpr char kTerminator[] = "Terminator";
-constexpr char kSystemBootInitiated[] = "System Boot Initiated";
-constexpr char kBootError[] = "Boot Error";
-constexpr char kOsBoot[] = "OS Boot";
 constexpr char kOsStopShutdown[] = "OS Stop/Shutdown";
 constexpr char kSlotConnector[] = "Slot/Connector";
-constexpr char kSystemAcpiPowerState[] = "System ACPI Power State";
 constexpr char kWatchdog2[] = "Watchdog 2";
-constexpr char kPlatformAlert[] = "Platform Alert";
-constexpr char kEntityPresence[] = "Entity Presence";
 constexpr char kMonitorAsic[] = "Monitor ASIC/IC";
-constexpr char kLan[] = "LAN";
-constexpr char kManagementSubsystemHealth[] = "Management Subsystem Health";
-constexpr char kBattery[] = "Battery";
-constexpr char kVersionChange[] = "Version Change";
-constexpr char kFruState[] = "FRU State";
 constexpr char kFruHotSwap[] = "FRU Hot Swap";
 constexpr char kIpmb0Status[] = "IPMB-0 Status";
 constexpr char kModuleHotSwap[] = "Module Hot Swap";
 
+// Event texts that several rows carry.
+constexpr char kConnected[] = "Connected";
+constexpr char kConfigError[] = "Config Error";
+constexpr char kConfigurationError[] = "Configuration Error";
+constexpr char kPresenceDetected[] = "Presence detected";
+constexpr char kPresenceDetectedUpper[] = "Presence Detected";
+constexpr char kDisabled[] = "Disabled";
+constexpr char kThrottled[] = "Throttled";
+constexpr char kPredictiveFailure[] = "Predictive failure";
+constexpr char kPowerCycle[] = "Power cycle";
+
 // The boot stages that System Firmware Hang and Progress events name in event data 3.
-constexpr char kFwUnspecified[] = "Unspecified";
 constexpr char kFwMemoryInit[] = "Memory initialization";
 constexpr char kFwHardDiskInit[] = "Hard-disk initialization";
 constexpr char kFwSecondaryCpuInit[] = "Secondary CPU Initialization";
@@ -90,7 +70,6 @@ constexpr char kFwDisablingDocking[] = "Disabling docking station";
 constexpr char kFwWakeUpVector[] = "Calling operating system wake-up vector";
 constexpr char kFwBootInitiated[] = "System boot initiated";
 constexpr char kFwMotherboardInit[] = "Motherboard initialization";
-constexpr char kReserved[] = "reserved";  // also the unused watchdog actions
 constexpr char kFwFloppyInit[] = "Floppy initialization";
 constexpr char kFwKeyboardTest[] = "Keyboard test";
 constexpr char kFwPointingDeviceTest[] = "Pointing device test";
@@ -179,69 +158,69 @@ constexpr ipmi_sel_row ipmi_sel_data[IPMI_SEL_DATA_ROWS] = {
     generic(0x0C, 0x03, kAcpiDevicePowerState, "D3 Power State"),
     // Never reached by SEL decoding (generic lookups stop at type 0x0C), kept for
     // the sensors' state names.
-    generic(0x17, 0x00, kAddInCard, "Add-in Card"),
-    generic(0x17, 0x01, kAddInCard, "Add-in Card"),
-    generic(0x1B, 0x00, kCableInterconnect, "Connected"),
-    generic(0x1B, 0x01, kCableInterconnect, "Config Error"),
+    generic(0x17, 0x00, st::addInCard, st::addInCard),
+    generic(0x17, 0x01, st::addInCard, st::addInCard),
+    generic(0x1B, 0x00, kCableInterconnect, kConnected),
+    generic(0x1B, 0x01, kCableInterconnect, kConfigError),
 
-    typeOnly(0x01, kTemperature),
-    typeOnly(0x02, kVoltage),
-    typeOnly(0x03, kCurrent),
-    typeOnly(0x04, kFan),
-    specific(0x05, 0x00, kPhysicalSecurity, "General Chassis intrusion"),
-    specific(0x05, 0x01, kPhysicalSecurity, "Drive Bay intrusion"),
-    specific(0x05, 0x02, kPhysicalSecurity, "I/O Card area intrusion"),
-    specific(0x05, 0x03, kPhysicalSecurity, "Processor area intrusion"),
-    specific(0x05, 0x04, kPhysicalSecurity, "System unplugged from LAN"),
-    specific(0x05, 0x05, kPhysicalSecurity, "Unauthorized dock"),
-    specific(0x05, 0x06, kPhysicalSecurity, "FAN area intrusion"),
-    specific(0x06, 0x00, kPlatformSecurity, "Front Panel Lockout violation attempted"),
-    specific(0x06, 0x01, kPlatformSecurity, "Pre-boot password violation - user password"),
-    specific(0x06, 0x02, kPlatformSecurity, "Pre-boot password violation - setup password"),
-    specific(0x06, 0x03, kPlatformSecurity, "Pre-boot password violation - network boot password"),
-    specific(0x06, 0x04, kPlatformSecurity, "Other pre-boot password violation"),
-    specific(0x06, 0x05, kPlatformSecurity, "Out-of-band access password violation"),
-    specific(0x07, 0x00, kProcessor, "IERR"),
-    specific(0x07, 0x01, kProcessor, "Thermal Trip"),
-    specific(0x07, 0x02, kProcessor, "FRB1/BIST failure"),
-    specific(0x07, 0x03, kProcessor, "FRB2/Hang in POST failure"),
-    specific(0x07, 0x04, kProcessor, "FRB3/Processor startup/init failure"),
-    specific(0x07, 0x05, kProcessor, "Configuration Error"),
-    specific(0x07, 0x06, kProcessor, "SM BIOS Uncorrectable CPU-complex Error"),
-    specific(0x07, 0x07, kProcessor, "Presence detected"),
-    specific(0x07, 0x08, kProcessor, "Disabled"),
-    specific(0x07, 0x09, kProcessor, "Terminator presence detected"),
-    specific(0x07, 0x0A, kProcessor, "Throttled"),
-    specific(0x08, 0x00, kPowerSupply, "Presence detected"),
-    specific(0x08, 0x01, kPowerSupply, "Failure status"),
-    specific(0x08, 0x02, kPowerSupply, "Predictive failure"),
-    specific(0x08, 0x03, kPowerSupply, "Power Supply AC lost"),
-    specific(0x08, 0x04, kPowerSupply, "AC lost or out-of-range"),
-    specific(0x08, 0x05, kPowerSupply, "AC out-of-range, but present"),
-    specificByData3(0x08, 0x06, 0x00, kPowerSupply, "Config Error: Vendor Mismatch"),
-    specificByData3(0x08, 0x06, 0x01, kPowerSupply, "Config Error: Revision Mismatch"),
-    specificByData3(0x08, 0x06, 0x02, kPowerSupply, "Config Error: Processor Missing"),
-    specific(0x08, 0x06, kPowerSupply, "Config Error"),
-    specific(0x09, 0x00, kPowerUnit, "Power off/down"),
-    specific(0x09, 0x01, kPowerUnit, "Power cycle"),
-    specific(0x09, 0x02, kPowerUnit, "240VA power down"),
-    specific(0x09, 0x03, kPowerUnit, "Interlock power down"),
-    specific(0x09, 0x04, kPowerUnit, "AC lost"),
-    specific(0x09, 0x05, kPowerUnit, "Soft-power control failure"),
-    specific(0x09, 0x06, kPowerUnit, "Failure detected"),
-    specific(0x09, 0x07, kPowerUnit, "Predictive failure"),
-    typeOnly(0x0A, kCoolingDevice),
+    typeOnly(0x01, st::temperature),
+    typeOnly(0x02, st::voltage),
+    typeOnly(0x03, st::current),
+    typeOnly(0x04, st::fan),
+    specific(0x05, 0x00, st::physicalSecurity, "General Chassis intrusion"),
+    specific(0x05, 0x01, st::physicalSecurity, "Drive Bay intrusion"),
+    specific(0x05, 0x02, st::physicalSecurity, "I/O Card area intrusion"),
+    specific(0x05, 0x03, st::physicalSecurity, "Processor area intrusion"),
+    specific(0x05, 0x04, st::physicalSecurity, "System unplugged from LAN"),
+    specific(0x05, 0x05, st::physicalSecurity, "Unauthorized dock"),
+    specific(0x05, 0x06, st::physicalSecurity, "FAN area intrusion"),
+    specific(0x06, 0x00, st::platformSecurity, "Front Panel Lockout violation attempted"),
+    specific(0x06, 0x01, st::platformSecurity, "Pre-boot password violation - user password"),
+    specific(0x06, 0x02, st::platformSecurity, "Pre-boot password violation - setup password"),
+    specific(0x06, 0x03, st::platformSecurity, "Pre-boot password violation - network boot password"),
+    specific(0x06, 0x04, st::platformSecurity, "Other pre-boot password violation"),
+    specific(0x06, 0x05, st::platformSecurity, "Out-of-band access password violation"),
+    specific(0x07, 0x00, st::processor, "IERR"),
+    specific(0x07, 0x01, st::processor, "Thermal Trip"),
+    specific(0x07, 0x02, st::processor, "FRB1/BIST failure"),
+    specific(0x07, 0x03, st::processor, "FRB2/Hang in POST failure"),
+    specific(0x07, 0x04, st::processor, "FRB3/Processor startup/init failure"),
+    specific(0x07, 0x05, st::processor, kConfigurationError),
+    specific(0x07, 0x06, st::processor, "SM BIOS Uncorrectable CPU-complex Error"),
+    specific(0x07, 0x07, st::processor, kPresenceDetected),
+    specific(0x07, 0x08, st::processor, kDisabled),
+    specific(0x07, 0x09, st::processor, "Terminator presence detected"),
+    specific(0x07, 0x0A, st::processor, kThrottled),
+    specific(0x08, 0x00, st::powerSupply, kPresenceDetected),
+    specific(0x08, 0x01, st::powerSupply, "Failure status"),
+    specific(0x08, 0x02, st::powerSupply, kPredictiveFailure),
+    specific(0x08, 0x03, st::powerSupply, "Power Supply AC lost"),
+    specific(0x08, 0x04, st::powerSupply, "AC lost or out-of-range"),
+    specific(0x08, 0x05, st::powerSupply, "AC out-of-range, but present"),
+    specificByData3(0x08, 0x06, 0x00, st::powerSupply, "Config Error: Vendor Mismatch"),
+    specificByData3(0x08, 0x06, 0x01, st::powerSupply, "Config Error: Revision Mismatch"),
+    specificByData3(0x08, 0x06, 0x02, st::powerSupply, "Config Error: Processor Missing"),
+    specific(0x08, 0x06, st::powerSupply, kConfigError),
+    specific(0x09, 0x00, st::powerUnit, "Power off/down"),
+    specific(0x09, 0x01, st::powerUnit, kPowerCycle),
+    specific(0x09, 0x02, st::powerUnit, "240VA power down"),
+    specific(0x09, 0x03, st::powerUnit, "Interlock power down"),
+    specific(0x09, 0x04, st::powerUnit, "AC lost"),
+    specific(0x09, 0x05, st::powerUnit, "Soft-power control failure"),
+    specific(0x09, 0x06, st::powerUnit, "Failure detected"),
+    specific(0x09, 0x07, st::powerUnit, kPredictiveFailure),
+    typeOnly(0x0A, st::coolingDevice),
     typeOnly(0x0B, kOtherUnitsBasedSensor),
-    specific(0x0C, 0x00, kMemory, "Correctable ECC"),
-    specific(0x0C, 0x01, kMemory, "Uncorrectable ECC"),
-    specific(0x0C, 0x02, kMemory, "Parity"),
-    specific(0x0C, 0x03, kMemory, "Memory Scrub Failed"),
-    specific(0x0C, 0x04, kMemory, "Memory Device Disabled"),
-    specific(0x0C, 0x05, kMemory, "Correctable ECC logging limit reached"),
-    specific(0x0C, 0x06, kMemory, "Presence Detected"),
-    specific(0x0C, 0x07, kMemory, "Configuration Error"),
-    specific(0x0C, 0x08, kMemory, "Spare"),
-    specific(0x0C, 0x09, kMemory, "Throttled"),
+    specific(0x0C, 0x00, st::memory, "Correctable ECC"),
+    specific(0x0C, 0x01, st::memory, "Uncorrectable ECC"),
+    specific(0x0C, 0x02, st::memory, "Parity"),
+    specific(0x0C, 0x03, st::memory, "Memory Scrub Failed"),
+    specific(0x0C, 0x04, st::memory, "Memory Device Disabled"),
+    specific(0x0C, 0x05, st::memory, "Correctable ECC logging limit reached"),
+    specific(0x0C, 0x06, st::memory, kPresenceDetectedUpper),
+    specific(0x0C, 0x07, st::memory, kConfigurationError),
+    specific(0x0C, 0x08, st::memory, "Spare"),
+    specific(0x0C, 0x09, st::memory, kThrottled),
     specific(0x0D, 0x00, kDriveSlot, "Drive Present"),
     specific(0x0D, 0x01, kDriveSlot, "Drive Fault"),
     specific(0x0D, 0x02, kDriveSlot, "Predictive Failure"),
@@ -251,10 +230,10 @@ constexpr ipmi_sel_row ipmi_sel_data[IPMI_SEL_DATA_ROWS] = {
     specific(0x0D, 0x06, kDriveSlot, "In Failed Array"),
     specific(0x0D, 0x07, kDriveSlot, "Rebuild In Progress"),
     specific(0x0D, 0x08, kDriveSlot, "Rebuild Aborted"),
-    typeOnly(0x0E, kPostMemoryResize),
+    typeOnly(0x0E, st::postMemoryResize),
     // System firmware events name their error, hang or progress code in event
     // data 3 (not event data 2), so that byte selects the text.
-    specificByData3(0x0F, 0x00, 0x00, kSystemFirmwareError, kFwUnspecified),
+    specificByData3(0x0F, 0x00, 0x00, kSystemFirmwareError, word::Unspecified),
     specificByData3(0x0F, 0x00, 0x01, kSystemFirmwareError, "No system memory installed"),
     specificByData3(0x0F, 0x00, 0x02, kSystemFirmwareError, "No usable system memory"),
     specificByData3(0x0F, 0x00, 0x03, kSystemFirmwareError, "Unrecoverable IDE device failure"),
@@ -272,7 +251,7 @@ constexpr ipmi_sel_row ipmi_sel_data[IPMI_SEL_DATA_ROWS] = {
     specificByData3(0x0F, 0x00, 0x0C, kSystemFirmwareError, "CPU voltage mismatch"),
     specificByData3(0x0F, 0x00, 0x0D, kSystemFirmwareError, "CPU speed mismatch failure"),
     specific(0x0F, 0x00, kSystemFirmwareError, "Unknown Error"),
-    specificByData3(0x0F, 0x01, 0x00, kSystemFirmwareHang, kFwUnspecified),
+    specificByData3(0x0F, 0x01, 0x00, kSystemFirmwareHang, word::Unspecified),
     specificByData3(0x0F, 0x01, 0x01, kSystemFirmwareHang, kFwMemoryInit),
     specificByData3(0x0F, 0x01, 0x02, kSystemFirmwareHang, kFwHardDiskInit),
     specificByData3(0x0F, 0x01, 0x03, kSystemFirmwareHang, kFwSecondaryCpuInit),
@@ -293,13 +272,13 @@ constexpr ipmi_sel_row ipmi_sel_data[IPMI_SEL_DATA_ROWS] = {
     specificByData3(0x0F, 0x01, 0x12, kSystemFirmwareHang, kFwWakeUpVector),
     specificByData3(0x0F, 0x01, 0x13, kSystemFirmwareHang, kFwBootInitiated),
     specificByData3(0x0F, 0x01, 0x14, kSystemFirmwareHang, kFwMotherboardInit),
-    specificByData3(0x0F, 0x01, 0x15, kSystemFirmwareHang, kReserved),
+    specificByData3(0x0F, 0x01, 0x15, kSystemFirmwareHang, word::reserved),
     specificByData3(0x0F, 0x01, 0x16, kSystemFirmwareHang, kFwFloppyInit),
     specificByData3(0x0F, 0x01, 0x17, kSystemFirmwareHang, kFwKeyboardTest),
     specificByData3(0x0F, 0x01, 0x18, kSystemFirmwareHang, kFwPointingDeviceTest),
     specificByData3(0x0F, 0x01, 0x19, kSystemFirmwareHang, kFwPrimaryCpuInit),
     specific(0x0F, 0x01, kSystemFirmwareHang, "Unknown Hang"),
-    specificByData3(0x0F, 0x02, 0x00, kSystemFirmwareProgress, kFwUnspecified),
+    specificByData3(0x0F, 0x02, 0x00, kSystemFirmwareProgress, word::Unspecified),
     specificByData3(0x0F, 0x02, 0x01, kSystemFirmwareProgress, kFwMemoryInit),
     specificByData3(0x0F, 0x02, 0x02, kSystemFirmwareProgress, kFwHardDiskInit),
     specificByData3(0x0F, 0x02, 0x03, kSystemFirmwareProgress, kFwSecondaryCpuInit),
@@ -320,18 +299,18 @@ constexpr ipmi_sel_row ipmi_sel_data[IPMI_SEL_DATA_ROWS] = {
     specificByData3(0x0F, 0x02, 0x12, kSystemFirmwareProgress, kFwWakeUpVector),
     specificByData3(0x0F, 0x02, 0x13, kSystemFirmwareProgress, kFwBootInitiated),
     specificByData3(0x0F, 0x02, 0x14, kSystemFirmwareProgress, kFwMotherboardInit),
-    specificByData3(0x0F, 0x02, 0x15, kSystemFirmwareProgress, kReserved),
+    specificByData3(0x0F, 0x02, 0x15, kSystemFirmwareProgress, word::reserved),
     specificByData3(0x0F, 0x02, 0x16, kSystemFirmwareProgress, kFwFloppyInit),
     specificByData3(0x0F, 0x02, 0x17, kSystemFirmwareProgress, kFwKeyboardTest),
     specificByData3(0x0F, 0x02, 0x18, kSystemFirmwareProgress, kFwPointingDeviceTest),
     specificByData3(0x0F, 0x02, 0x19, kSystemFirmwareProgress, kFwPrimaryCpuInit),
     specific(0x0F, 0x02, kSystemFirmwareProgress, "Unknown Progress"),
-    specific(0x10, 0x00, kEventLoggingDisabled, "Correctable memory error logging disabled"),
-    specific(0x10, 0x01, kEventLoggingDisabled, "Event logging disabled"),
-    specific(0x10, 0x02, kEventLoggingDisabled, "Log area reset/cleared"),
-    specific(0x10, 0x03, kEventLoggingDisabled, "All event logging disabled"),
-    specific(0x10, 0x04, kEventLoggingDisabled, "Log full"),
-    specific(0x10, 0x05, kEventLoggingDisabled, "Log almost full"),
+    specific(0x10, 0x00, st::eventLoggingDisabled, "Correctable memory error logging disabled"),
+    specific(0x10, 0x01, st::eventLoggingDisabled, "Event logging disabled"),
+    specific(0x10, 0x02, st::eventLoggingDisabled, "Log area reset/cleared"),
+    specific(0x10, 0x03, st::eventLoggingDisabled, "All event logging disabled"),
+    specific(0x10, 0x04, st::eventLoggingDisabled, "Log full"),
+    specific(0x10, 0x05, st::eventLoggingDisabled, "Log almost full"),
     specific(0x11, 0x00, kWatchdog1, "BIOS Reset"),
     specific(0x11, 0x01, kWatchdog1, "OS Reset"),
     specific(0x11, 0x02, kWatchdog1, "OS Shut Down"),
@@ -340,57 +319,57 @@ constexpr ipmi_sel_row ipmi_sel_data[IPMI_SEL_DATA_ROWS] = {
     specific(0x11, 0x05, kWatchdog1, "OS NMI/Diag Interrupt"),
     specific(0x11, 0x06, kWatchdog1, "OS Expired"),
     specific(0x11, 0x07, kWatchdog1, "OS pre-timeout Interrupt"),
-    specific(0x12, 0x00, kSystemEvent, "System Reconfigured"),
-    specific(0x12, 0x01, kSystemEvent, "OEM System boot event"),
-    specific(0x12, 0x02, kSystemEvent, "Undetermined system hardware failure"),
-    specific(0x12, 0x03, kSystemEvent, "Entry added to auxiliary log"),
-    specific(0x12, 0x04, kSystemEvent, "PEF Action"),
-    specific(0x12, 0x05, kSystemEvent, "Timestamp Clock Sync"),
-    specific(0x13, 0x00, kCriticalInterrupt, "NMI/Diag Interrupt"),
-    specific(0x13, 0x01, kCriticalInterrupt, "Bus Timeout"),
-    specific(0x13, 0x02, kCriticalInterrupt, "I/O Channel check NMI"),
-    specific(0x13, 0x03, kCriticalInterrupt, "Software NMI"),
-    specific(0x13, 0x04, kCriticalInterrupt, "PCI PERR"),
-    specific(0x13, 0x05, kCriticalInterrupt, "PCI SERR"),
-    specific(0x13, 0x06, kCriticalInterrupt, "EISA failsafe timeout"),
-    specific(0x13, 0x07, kCriticalInterrupt, "Bus Correctable error"),
-    specific(0x13, 0x08, kCriticalInterrupt, "Bus Uncorrectable error"),
-    specific(0x13, 0x09, kCriticalInterrupt, "Fatal NMI"),
-    specific(0x13, 0x0A, kCriticalInterrupt, "Bus Fatal Error"),
-    specific(0x14, 0x00, kButton, "Power Button pressed"),
-    specific(0x14, 0x01, kButton, "Sleep Button pressed"),
-    specific(0x14, 0x02, kButton, "Reset Button pressed"),
-    specific(0x14, 0x03, kButton, "FRU Latch"),
-    specific(0x14, 0x04, kButton, "FRU Service"),
+    specific(0x12, 0x00, st::systemEvent, "System Reconfigured"),
+    specific(0x12, 0x01, st::systemEvent, "OEM System boot event"),
+    specific(0x12, 0x02, st::systemEvent, "Undetermined system hardware failure"),
+    specific(0x12, 0x03, st::systemEvent, "Entry added to auxiliary log"),
+    specific(0x12, 0x04, st::systemEvent, "PEF Action"),
+    specific(0x12, 0x05, st::systemEvent, "Timestamp Clock Sync"),
+    specific(0x13, 0x00, st::criticalInterrupt, "NMI/Diag Interrupt"),
+    specific(0x13, 0x01, st::criticalInterrupt, "Bus Timeout"),
+    specific(0x13, 0x02, st::criticalInterrupt, "I/O Channel check NMI"),
+    specific(0x13, 0x03, st::criticalInterrupt, "Software NMI"),
+    specific(0x13, 0x04, st::criticalInterrupt, "PCI PERR"),
+    specific(0x13, 0x05, st::criticalInterrupt, "PCI SERR"),
+    specific(0x13, 0x06, st::criticalInterrupt, "EISA failsafe timeout"),
+    specific(0x13, 0x07, st::criticalInterrupt, "Bus Correctable error"),
+    specific(0x13, 0x08, st::criticalInterrupt, "Bus Uncorrectable error"),
+    specific(0x13, 0x09, st::criticalInterrupt, "Fatal NMI"),
+    specific(0x13, 0x0A, st::criticalInterrupt, "Bus Fatal Error"),
+    specific(0x14, 0x00, st::button, "Power Button pressed"),
+    specific(0x14, 0x01, st::button, "Sleep Button pressed"),
+    specific(0x14, 0x02, st::button, "Reset Button pressed"),
+    specific(0x14, 0x03, st::button, "FRU Latch"),
+    specific(0x14, 0x04, st::button, "FRU Service"),
     typeOnly(0x15, kModuleBoard),
     typeOnly(0x16, kMicrocontroller),
-    typeOnly(0x17, kAddInCard),
-    typeOnly(0x18, kChassis),
-    typeOnly(0x19, kChipSet),
-    typeOnly(0x1A, kOtherFru),
-    specific(0x1B, 0x00, kCableInterconnect, "Connected"),
-    specific(0x1B, 0x01, kCableInterconnect, "Config Error"),
-    typeOnly(0x1C, kTerminator),
-    specific(0x1D, 0x00, kSystemBootInitiated, "Initiated by power up"),
-    specific(0x1D, 0x01, kSystemBootInitiated, "Initiated by hard reset"),
-    specific(0x1D, 0x02, kSystemBootInitiated, "Initiated by warm reset"),
-    specific(0x1D, 0x03, kSystemBootInitiated, "User requested PXE boot"),
-    specific(0x1D, 0x04, kSystemBootInitiated, "Automatic boot to diagnostic"),
-    specific(0x1D, 0x05, kSystemBootInitiated, "OS initiated hard reset"),
-    specific(0x1D, 0x06, kSystemBootInitiated, "OS initiated warm reset"),
-    specific(0x1D, 0x07, kSystemBootInitiated, "System Restart"),
-    specific(0x1E, 0x00, kBootError, "No bootable media"),
-    specific(0x1E, 0x01, kBootError, "Non-bootable disk in drive"),
-    specific(0x1E, 0x02, kBootError, "PXE server not found"),
-    specific(0x1E, 0x03, kBootError, "Invalid boot sector"),
-    specific(0x1E, 0x04, kBootError, "Timeout waiting for selection"),
-    specific(0x1F, 0x00, kOsBoot, "A: boot completed"),
-    specific(0x1F, 0x01, kOsBoot, "C: boot completed"),
-    specific(0x1F, 0x02, kOsBoot, "PXE boot completed"),
-    specific(0x1F, 0x03, kOsBoot, "Diagnostic boot completed"),
-    specific(0x1F, 0x04, kOsBoot, "CD-ROM boot completed"),
-    specific(0x1F, 0x05, kOsBoot, "ROM boot completed"),
-    specific(0x1F, 0x06, kOsBoot, "boot completed - device not specified"),
+    typeOnly(0x17, st::addInCard),
+    typeOnly(0x18, st::chassis),
+    typeOnly(0x19, st::chipSet),
+    typeOnly(0x1A, st::otherFru),
+    specific(0x1B, 0x00, kCableInterconnect, kConnected),
+    specific(0x1B, 0x01, kCableInterconnect, kConfigError),
+    typeOnly(0x1C, st::terminator),
+    specific(0x1D, 0x00, st::systemBootInitiated, "Initiated by power up"),
+    specific(0x1D, 0x01, st::systemBootInitiated, "Initiated by hard reset"),
+    specific(0x1D, 0x02, st::systemBootInitiated, "Initiated by warm reset"),
+    specific(0x1D, 0x03, st::systemBootInitiated, "User requested PXE boot"),
+    specific(0x1D, 0x04, st::systemBootInitiated, "Automatic boot to diagnostic"),
+    specific(0x1D, 0x05, st::systemBootInitiated, "OS initiated hard reset"),
+    specific(0x1D, 0x06, st::systemBootInitiated, "OS initiated warm reset"),
+    specific(0x1D, 0x07, st::systemBootInitiated, "System Restart"),
+    specific(0x1E, 0x00, st::bootError, "No bootable media"),
+    specific(0x1E, 0x01, st::bootError, "Non-bootable disk in drive"),
+    specific(0x1E, 0x02, st::bootError, "PXE server not found"),
+    specific(0x1E, 0x03, st::bootError, "Invalid boot sector"),
+    specific(0x1E, 0x04, st::bootError, "Timeout waiting for selection"),
+    specific(0x1F, 0x00, st::osBoot, "A: boot completed"),
+    specific(0x1F, 0x01, st::osBoot, "C: boot completed"),
+    specific(0x1F, 0x02, st::osBoot, "PXE boot completed"),
+    specific(0x1F, 0x03, st::osBoot, "Diagnostic boot completed"),
+    specific(0x1F, 0x04, st::osBoot, "CD-ROM boot completed"),
+    specific(0x1F, 0x05, st::osBoot, "ROM boot completed"),
+    specific(0x1F, 0x06, st::osBoot, "boot completed - device not specified"),
     specific(0x20, 0x00, kOsStopShutdown, "Error during system startup"),
     specific(0x20, 0x01, kOsStopShutdown, "Run-time critical stop"),
     specific(0x20, 0x02, kOsStopShutdown, "OS graceful stop"),
@@ -407,66 +386,66 @@ constexpr ipmi_sel_row ipmi_sel_data[IPMI_SEL_DATA_ROWS] = {
     specific(0x21, 0x07, kSlotConnector, "Interlock"),
     specific(0x21, 0x08, kSlotConnector, "Slot is Disabled"),
     specific(0x21, 0x09, kSlotConnector, "Spare Device"),
-    specific(0x22, 0x00, kSystemAcpiPowerState, "S0/G0: working"),
-    specific(0x22, 0x01, kSystemAcpiPowerState,
+    specific(0x22, 0x00, st::systemAcpiPowerState, "S0/G0: working"),
+    specific(0x22, 0x01, st::systemAcpiPowerState,
              "S1: sleeping with system hw & processor context maintained"),
-    specific(0x22, 0x02, kSystemAcpiPowerState, "S2: sleeping, processor context lost"),
-    specific(0x22, 0x03, kSystemAcpiPowerState,
+    specific(0x22, 0x02, st::systemAcpiPowerState, "S2: sleeping, processor context lost"),
+    specific(0x22, 0x03, st::systemAcpiPowerState,
              "S3: sleeping, processor & hw context lost, memory retained"),
-    specific(0x22, 0x04, kSystemAcpiPowerState, "S4: non-volatile sleep/suspend-to-disk"),
-    specific(0x22, 0x05, kSystemAcpiPowerState, "S5/G2: soft-off"),
-    specific(0x22, 0x06, kSystemAcpiPowerState, "S4/S5: soft-off"),
-    specific(0x22, 0x07, kSystemAcpiPowerState, "G3: mechanical off"),
-    specific(0x22, 0x08, kSystemAcpiPowerState, "Sleeping in S1/S2/S3 state"),
-    specific(0x22, 0x09, kSystemAcpiPowerState, "G1: sleeping"),
-    specific(0x22, 0x0A, kSystemAcpiPowerState, "S5: entered by override"),
-    specific(0x22, 0x0B, kSystemAcpiPowerState, "Legacy ON state"),
-    specific(0x22, 0x0C, kSystemAcpiPowerState, "Legacy OFF state"),
-    specific(0x22, 0x0E, kSystemAcpiPowerState, "Unknown"),
+    specific(0x22, 0x04, st::systemAcpiPowerState, "S4: non-volatile sleep/suspend-to-disk"),
+    specific(0x22, 0x05, st::systemAcpiPowerState, "S5/G2: soft-off"),
+    specific(0x22, 0x06, st::systemAcpiPowerState, "S4/S5: soft-off"),
+    specific(0x22, 0x07, st::systemAcpiPowerState, "G3: mechanical off"),
+    specific(0x22, 0x08, st::systemAcpiPowerState, "Sleeping in S1/S2/S3 state"),
+    specific(0x22, 0x09, st::systemAcpiPowerState, "G1: sleeping"),
+    specific(0x22, 0x0A, st::systemAcpiPowerState, "S5: entered by override"),
+    specific(0x22, 0x0B, st::systemAcpiPowerState, "Legacy ON state"),
+    specific(0x22, 0x0C, st::systemAcpiPowerState, "Legacy OFF state"),
+    specific(0x22, 0x0E, st::systemAcpiPowerState, "Unknown"),
     specific(0x23, 0x00, kWatchdog2, "Timer expired"),
     specific(0x23, 0x01, kWatchdog2, "Hard reset"),
     specific(0x23, 0x02, kWatchdog2, "Power down"),
-    specific(0x23, 0x03, kWatchdog2, "Power cycle"),
-    specific(0x23, 0x04, kWatchdog2, kReserved),
-    specific(0x23, 0x05, kWatchdog2, kReserved),
-    specific(0x23, 0x06, kWatchdog2, kReserved),
-    specific(0x23, 0x07, kWatchdog2, kReserved),
+    specific(0x23, 0x03, kWatchdog2, kPowerCycle),
+    specific(0x23, 0x04, kWatchdog2, word::reserved),
+    specific(0x23, 0x05, kWatchdog2, word::reserved),
+    specific(0x23, 0x06, kWatchdog2, word::reserved),
+    specific(0x23, 0x07, kWatchdog2, word::reserved),
     specific(0x23, 0x08, kWatchdog2, "Timer interrupt"),
-    specific(0x24, 0x00, kPlatformAlert, "Platform generated page"),
-    specific(0x24, 0x01, kPlatformAlert, "Platform generated LAN alert"),
-    specific(0x24, 0x02, kPlatformAlert, "Platform Event Trap generated"),
-    specific(0x24, 0x03, kPlatformAlert, "Platform generated SNMP trap, OEM format"),
-    specific(0x25, 0x00, kEntityPresence, "Present"),
-    specific(0x25, 0x01, kEntityPresence, "Absent"),
-    specific(0x25, 0x02, kEntityPresence, "Disabled"),
+    specific(0x24, 0x00, st::platformAlert, "Platform generated page"),
+    specific(0x24, 0x01, st::platformAlert, "Platform generated LAN alert"),
+    specific(0x24, 0x02, st::platformAlert, "Platform Event Trap generated"),
+    specific(0x24, 0x03, st::platformAlert, "Platform generated SNMP trap, OEM format"),
+    specific(0x25, 0x00, st::entityPresence, "Present"),
+    specific(0x25, 0x01, st::entityPresence, "Absent"),
+    specific(0x25, 0x02, st::entityPresence, kDisabled),
     typeOnly(0x26, kMonitorAsic),
-    specific(0x27, 0x00, kLan, "Heartbeat Lost"),
-    specific(0x27, 0x01, kLan, "Heartbeat"),
-    specific(0x28, 0x00, kManagementSubsystemHealth, "Sensor access degraded or unavailable"),
-    specific(0x28, 0x01, kManagementSubsystemHealth, "Controller access degraded or unavailable"),
-    specific(0x28, 0x02, kManagementSubsystemHealth, "Management controller off-line"),
-    specific(0x28, 0x03, kManagementSubsystemHealth, "Management controller unavailable"),
-    specific(0x28, 0x04, kManagementSubsystemHealth, "Sensor failure"),
-    specific(0x28, 0x05, kManagementSubsystemHealth, "FRU failure"),
-    specific(0x29, 0x00, kBattery, "Low"),
-    specific(0x29, 0x01, kBattery, "Failed"),
-    specific(0x29, 0x02, kBattery, "Presence Detected"),
-    specific(0x2B, 0x00, kVersionChange, "Hardware change detected"),
-    specific(0x2B, 0x01, kVersionChange, "Firmware or software change detected"),
-    specific(0x2B, 0x02, kVersionChange, "Hardware incompatibility detected"),
-    specific(0x2B, 0x03, kVersionChange, "Firmware or software incompatibility detected"),
-    specific(0x2B, 0x04, kVersionChange, "Invalid or unsupported hardware version"),
-    specific(0x2B, 0x05, kVersionChange, "Invalid or unsupported firmware or software version"),
-    specific(0x2B, 0x06, kVersionChange, "Hardware change success"),
-    specific(0x2B, 0x07, kVersionChange, "Firmware or software change success"),
-    specific(0x2C, 0x00, kFruState, "Not Installed"),
-    specific(0x2C, 0x01, kFruState, "Inactive"),
-    specific(0x2C, 0x02, kFruState, "Activation Requested"),
-    specific(0x2C, 0x03, kFruState, "Activation in Progress"),
-    specific(0x2C, 0x04, kFruState, "Active"),
-    specific(0x2C, 0x05, kFruState, "Deactivation Requested"),
-    specific(0x2C, 0x06, kFruState, "Deactivation in Progress"),
-    specific(0x2C, 0x07, kFruState, "Communication lost"),
+    specific(0x27, 0x00, st::lan, "Heartbeat Lost"),
+    specific(0x27, 0x01, st::lan, "Heartbeat"),
+    specific(0x28, 0x00, st::managementSubsystemHealth, "Sensor access degraded or unavailable"),
+    specific(0x28, 0x01, st::managementSubsystemHealth, "Controller access degraded or unavailable"),
+    specific(0x28, 0x02, st::managementSubsystemHealth, "Management controller off-line"),
+    specific(0x28, 0x03, st::managementSubsystemHealth, "Management controller unavailable"),
+    specific(0x28, 0x04, st::managementSubsystemHealth, "Sensor failure"),
+    specific(0x28, 0x05, st::managementSubsystemHealth, "FRU failure"),
+    specific(0x29, 0x00, st::battery, "Low"),
+    specific(0x29, 0x01, st::battery, "Failed"),
+    specific(0x29, 0x02, st::battery, kPresenceDetectedUpper),
+    specific(0x2B, 0x00, st::versionChange, "Hardware change detected"),
+    specific(0x2B, 0x01, st::versionChange, "Firmware or software change detected"),
+    specific(0x2B, 0x02, st::versionChange, "Hardware incompatibility detected"),
+    specific(0x2B, 0x03, st::versionChange, "Firmware or software incompatibility detected"),
+    specific(0x2B, 0x04, st::versionChange, "Invalid or unsupported hardware version"),
+    specific(0x2B, 0x05, st::versionChange, "Invalid or unsupported firmware or software version"),
+    specific(0x2B, 0x06, st::versionChange, "Hardware change success"),
+    specific(0x2B, 0x07, st::versionChange, "Firmware or software change success"),
+    specific(0x2C, 0x00, st::fruState, "Not Installed"),
+    specific(0x2C, 0x01, st::fruState, "Inactive"),
+    specific(0x2C, 0x02, st::fruState, "Activation Requested"),
+    specific(0x2C, 0x03, st::fruState, "Activation in Progress"),
+    specific(0x2C, 0x04, st::fruState, "Active"),
+    specific(0x2C, 0x05, st::fruState, "Deactivation Requested"),
+    specific(0x2C, 0x06, st::fruState, "Deactivation in Progress"),
+    specific(0x2C, 0x07, st::fruState, "Communication lost"),
     specific(0xF0, 0x00, kFruHotSwap, "Transition to M0"),
     specific(0xF0, 0x01, kFruHotSwap, "Transition to M1"),
     specific(0xF0, 0x02, kFruHotSwap, "Transition to M2"),
@@ -697,7 +676,7 @@ void build_sel_desc(Event_log record, char* dst, int size) {
 
 std::string GetMessage(Event_log record) {
     const char* text = eventText(record);
-    if (!text) return kTextNotAvailable;
+    if (!text) return word::notAvailable;
     char message[kMessageBufferSize];
     snprintf(message, sizeof message, "%s", text);
     return message;
