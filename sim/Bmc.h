@@ -60,6 +60,8 @@ public:
     SelModel sel;
     LanModel lan;
     FruModel fru;
+    // Other controllers on IPMB (management engine, backplanes...), by slave address.
+    std::map<uint8_t, Identity> satellites;
 
     // The sensor a request addresses, or null.
     SensorModel* findSensor(uint8_t owner, uint8_t lun, uint8_t number);
