@@ -13,7 +13,8 @@ namespace {
 
 namespace st = sensorTypeName;
 
-// Names of the event/reading types and of the sensor types, as the rows carry them.
+// Names of the event/reading types and of the sensor types, as the rows carry
+// them (those the sensors' type texts also use are in the header).
 constexpr char kThreshold[] = "Threshold";
 constexpr char kUsageState[] = "Usage State";
 constexpr char kDigitalState[] = "Digital State";
@@ -623,6 +624,8 @@ const int32_t (&V_array)[IPMI_SEL_DATA_ROWS] = kHash.v;
 const ipmi_event_type* const generic_sensor_event_types = kGenericEventTypes.data();
 const ipmi_event_type* const sensor_specific_event_types = kSpecificEventTypes.data();
 
+// The hash is minimal: every slot of V_array holds a row, so any key, listed or
+// not, names a row of the table.
 uint32_t perfect_hash_lookup(uint32_t key) { return lookupRow(G_array, V_array, key); }
 
 const char* find_generic_desc(uint8_t eventType, uint8_t data1) {
