@@ -85,7 +85,8 @@ public:
     void getSDReading();
     unsigned int getReading();
     unsigned int getReading(bool refresh);
-    double getReading(unsigned raw) const;
+    // Not const, so that a literal such as 100u picks this overload and not the bool one.
+    double getReading(unsigned raw);
     void setReading(unsigned char* five_bytes);
     void setThresholdReading(unsigned char* eight_bytes);
     void getReadingTime(std::string& out) const;

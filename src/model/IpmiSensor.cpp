@@ -333,7 +333,7 @@ unsigned int IpmiSensor::getReading() {
 
 unsigned int IpmiSensor::getReading(bool) { return getReading(); }
 
-double IpmiSensor::getReading(unsigned raw) const { return convertRawValue(raw); }
+double IpmiSensor::getReading(unsigned raw) { return convertRawValue(raw); }
 
 void IpmiSensor::setReading(unsigned char* five_bytes) {
     if (five_bytes == nullptr) return;
