@@ -19,7 +19,7 @@ struct SdrModel {
     uint16_t reservation = 0;  // 0: none granted yet
     uint32_t additionTimestamp = 0;
     uint32_t eraseTimestamp = 0;
-    uint8_t operationSupport = 0x23;  // reserve supported, non-modal update, no allocation info
+    uint8_t operationSupport = 0x22;  // non-modal update, reserve supported, no allocation info
     // Largest record slice one Get SDR answers; asking more gives 0xCA.
     uint8_t maxReadBytes = 28;
 };

@@ -158,7 +158,7 @@ protected:
     void reportRecordCount(uint16_t count) {
         bmc().on(netfn::storage, cmd::getSdrRepositoryInfo, [count](Sim::Bmc& b, const Sim::Request&) {
             return Sim::Response{0x00, b.sdr.version, static_cast<uint8_t>(count & 0xFF),
-                                 static_cast<uint8_t>(count >> 8), 0, 0x10, 0, 0, 0, 0, 0, 0, 0, 0, 0x23};
+                                 static_cast<uint8_t>(count >> 8), 0, 0x10, 0, 0, 0, 0, 0, 0, 0, 0, b.sdr.operationSupport};
         });
     }
 
