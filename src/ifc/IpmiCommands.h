@@ -56,6 +56,7 @@ constexpr uint8_t getLanConfigParameters = 0x02;
 namespace cc {
 constexpr uint8_t ok = 0x00;
 constexpr uint8_t parameterNotSupported = 0x80;  // system info / LAN parameters
+constexpr uint8_t eraseInProgress = 0x81;        // SEL commands while the log is being erased
 constexpr uint8_t nodeBusy = 0xC0;
 constexpr uint8_t invalidCommand = 0xC1;
 constexpr uint8_t timeout = 0xC3;
@@ -72,6 +73,56 @@ constexpr uint8_t illegalForSensorType = 0xCD;
 constexpr uint8_t responseNotProvided = 0xCE;
 constexpr uint8_t unspecifiedError = 0xFF;
 }  // namespace cc
+
+// System information parameters (Get/Set System Info Parameters).
+namespace sysInfoParam {
+constexpr uint8_t osName = 4;
+constexpr uint8_t osVersion = 5;
+}  // namespace sysInfoParam
+
+// LAN configuration parameters (Get/Set LAN Configuration Parameters).
+namespace lanParam {
+constexpr uint8_t setInProgress = 0;
+constexpr uint8_t authTypeSupport = 1;
+constexpr uint8_t authTypeEnables = 2;
+constexpr uint8_t ipAddress = 3;
+constexpr uint8_t ipAddressSource = 4;
+constexpr uint8_t macAddress = 5;
+constexpr uint8_t subnetMask = 6;
+constexpr uint8_t ipv4HeaderParameters = 7;
+constexpr uint8_t bmcArpControl = 10;
+constexpr uint8_t gratuitousArpInterval = 11;
+constexpr uint8_t defaultGatewayAddress = 12;
+constexpr uint8_t defaultGatewayMac = 13;
+constexpr uint8_t backupGatewayAddress = 14;
+constexpr uint8_t backupGatewayMac = 15;
+constexpr uint8_t communityString = 16;
+constexpr uint8_t vlanId = 20;
+constexpr uint8_t vlanPriority = 21;
+constexpr uint8_t cipherSuiteEntrySupport = 22;
+constexpr uint8_t cipherSuiteEntries = 23;
+constexpr uint8_t cipherSuitePrivilegeLevels = 24;
+constexpr uint8_t badPasswordThreshold = 26;
+constexpr uint8_t ipv6StaticAddresses = 0x38;
+}  // namespace lanParam
+
+// IP address source byte of LAN parameter 4.
+namespace ipSource {
+constexpr uint8_t unspecified = 0;
+constexpr uint8_t staticAddress = 1;
+constexpr uint8_t dhcp = 2;
+constexpr uint8_t bios = 3;
+constexpr uint8_t other = 4;
+}  // namespace ipSource
+
+// Channel medium types (Get Channel Info).
+namespace channelMedium {
+constexpr uint8_t ipmb = 0x01;
+constexpr uint8_t lan8023 = 0x04;
+constexpr uint8_t asyncSerial = 0x05;
+constexpr uint8_t otherLan = 0x06;
+constexpr uint8_t systemInterface = 0x0C;
+}  // namespace channelMedium
 }  // namespace Ipmi
 
 #endif

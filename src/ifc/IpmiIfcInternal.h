@@ -97,6 +97,22 @@ int IpmiIfcRhGetOS_Name(ipmiifc_resp* r);
 int IpmiIfcRhGetOS_Version(ipmiifc_resp* r);
 bool set_bmc_prop(const char* value, unsigned int length, unsigned char parameter, unsigned char* ccOut);
 
+// Guards the one-time fill of the manufacturer-name table and pollAll's
+// one-time scaling of the skip steps.
+extern pthread_mutex_t manNameInitMut;
+
+// Scope guard for a plain, statically initialised pthread mutex.
+class PlainMutexLock {
+public:
+    explicit PlainMutexLock(pthread_mutex_t& m) : mutex_(m) { pthread_mutex_lock(&mutex_); }
+    ~PlainMutexLock() { pthread_mutex_unlock(&mutex_); }
+    PlainMutexLock(const PlainMutexLock&) = delete;
+    PlainMutexLock& operator=(const PlainMutexLock&) = delete;
+
+private:
+    pthread_mutex_t& mutex_;
+};
+
 // Polling rhythm tunables.
 extern int SKIP_SDR_STEP;
 extern int SKIP_FRU_STEP;
@@ -131,6 +147,7 @@ void IpmiIfcEntityCleanUpAll(int node);
 
 // SEL.
 uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count);
+uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count);
 int IpmiIfcRhSelInfoNoCount(ipmiifc_resp* resp);
 int IpmiIfcRhSelGetAllocInfo(ipmiifc_resp* resp);
 void IpmiIfcSelCleanUpEventHandlers(int node);
