@@ -65,7 +65,7 @@ struct Row {
 Row thresholdRow(Ipmi::IpmiSensor& sensor) {
     Row row;
     const unsigned raw = sensor.getReading();  // asks the controller
-    if (sensor.readingStateUnavailable() || !sensor.isConvertible()) {
+    if (sensor.readingStateUnavailable() || sensor.scanningDisabled() || !sensor.isConvertible()) {
         row.reading = "na";
     } else {
         row.reading = valueText(sensor.convertRawValue(raw));
