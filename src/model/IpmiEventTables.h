@@ -35,46 +35,46 @@ enum : uint8_t {
 
 // Words that the event rows share with the sensors' own texts.
 namespace word {
-inline constexpr char notAvailable[] = "N/A";  // no state or message text
-inline constexpr char reserved[] = "reserved";
-inline constexpr char Unspecified[] = "Unspecified";
+constexpr char notAvailable[] = "N/A";  // no state or message text
+constexpr char reserved[] = "reserved";
+constexpr char Unspecified[] = "Unspecified";
 }  // namespace word
 
 // Sensor type names that the event rows share with the sensors' type texts
 // (where the two vocabularies differ, each file keeps its own).
 namespace sensorTypeName {
-inline constexpr char temperature[] = "Temperature";
-inline constexpr char voltage[] = "Voltage";
-inline constexpr char current[] = "Current";
-inline constexpr char fan[] = "Fan";
-inline constexpr char physicalSecurity[] = "Physical Security";
-inline constexpr char platformSecurity[] = "Platform Security";
-inline constexpr char processor[] = "Processor";
-inline constexpr char powerSupply[] = "Power Supply";
-inline constexpr char powerUnit[] = "Power Unit";
-inline constexpr char coolingDevice[] = "Cooling Device";
-inline constexpr char memory[] = "Memory";
-inline constexpr char postMemoryResize[] = "POST Memory Resize";
-inline constexpr char eventLoggingDisabled[] = "Event Logging Disabled";
-inline constexpr char systemEvent[] = "System Event";
-inline constexpr char criticalInterrupt[] = "Critical Interrupt";
-inline constexpr char button[] = "Button";
-inline constexpr char addInCard[] = "Add-in Card";
-inline constexpr char chassis[] = "Chassis";
-inline constexpr char chipSet[] = "Chip Set";
-inline constexpr char otherFru[] = "Other FRU";
-inline constexpr char terminator[] = "Terminator";
-inline constexpr char systemBootInitiated[] = "System Boot Initiated";
-inline constexpr char bootError[] = "Boot Error";
-inline constexpr char osBoot[] = "OS Boot";
-inline constexpr char systemAcpiPowerState[] = "System ACPI Power State";
-inline constexpr char platformAlert[] = "Platform Alert";
-inline constexpr char entityPresence[] = "Entity Presence";
-inline constexpr char lan[] = "LAN";
-inline constexpr char managementSubsystemHealth[] = "Management Subsystem Health";
-inline constexpr char battery[] = "Battery";
-inline constexpr char versionChange[] = "Version Change";
-inline constexpr char fruState[] = "FRU State";
+constexpr char temperature[] = "Temperature";
+constexpr char voltage[] = "Voltage";
+constexpr char current[] = "Current";
+constexpr char fan[] = "Fan";
+constexpr char physicalSecurity[] = "Physical Security";
+constexpr char platformSecurity[] = "Platform Security";
+constexpr char processor[] = "Processor";
+constexpr char powerSupply[] = "Power Supply";
+constexpr char powerUnit[] = "Power Unit";
+constexpr char coolingDevice[] = "Cooling Device";
+constexpr char memory[] = "Memory";
+constexpr char postMemoryResize[] = "POST Memory Resize";
+constexpr char eventLoggingDisabled[] = "Event Logging Disabled";
+constexpr char systemEvent[] = "System Event";
+constexpr char criticalInterrupt[] = "Critical Interrupt";
+constexpr char button[] = "Button";
+constexpr char addInCard[] = "Add-in Card";
+constexpr char chassis[] = "Chassis";
+constexpr char chipSet[] = "Chip Set";
+constexpr char otherFru[] = "Other FRU";
+constexpr char terminator[] = "Terminator";
+constexpr char systemBootInitiated[] = "System Boot Initiated";
+constexpr char bootError[] = "Boot Error";
+constexpr char osBoot[] = "OS Boot";
+constexpr char systemAcpiPowerState[] = "System ACPI Power State";
+constexpr char platformAlert[] = "Platform Alert";
+constexpr char entityPresence[] = "Entity Presence";
+constexpr char lan[] = "LAN";
+constexpr char managementSubsystemHealth[] = "Management Subsystem Health";
+constexpr char battery[] = "Battery";
+constexpr char versionChange[] = "Version Change";
+constexpr char fruState[] = "FRU State";
 }  // namespace sensorTypeName
 
 struct ipmi_sel_row {
