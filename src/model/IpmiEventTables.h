@@ -33,7 +33,9 @@ enum : uint8_t {
     EVENT_TYPE_SENSOR_SPECIFIC = 0x6F
 };
 
-// Words that the event rows share with the sensors' own texts.
+// Words that the event rows share with the sensors' own texts. These are not
+// inline variables: GCC stops treating the address of one as a constant when
+// the sanitizers are on, and the state name tables are built at compile time.
 namespace word {
 constexpr char notAvailable[] = "N/A";  // no state or message text
 constexpr char reserved[] = "reserved";
