@@ -104,6 +104,7 @@ protected:
     void TearDown() override {
         IpmiIfcSdrCleanUpAll(0);
         IpmiIfcSdrCleanUpHeaders(0);
+        IpmiIfcEntityCleanUpAll(0);  // the chain builds the entity tree too
         SimTest::TearDown();
     }
 
