@@ -8,6 +8,7 @@
 
 #include "Bmc.h"
 #include "IpmiCommands.h"
+#include "SdrLayout.h"
 
 namespace Sim {
 
@@ -15,8 +16,6 @@ using namespace Ipmi;
 
 namespace {
 
-constexpr size_t kHeaderBytes = 5;
-constexpr size_t kHeaderLength = 4;  // bytes after the header
 constexpr uint16_t kFirstRecord = 0x0000;
 constexpr uint16_t kNoMoreRecords = 0xFFFF;
 constexpr uint8_t kWholeRecord = 0xFF;
@@ -48,7 +47,7 @@ void putLe32(Response& r, uint32_t v) {
 }
 
 uint16_t recordIdOf(const std::vector<uint8_t>& record) {
-    return record.size() >= 2 ? le16(record, 0) : kNoMoreRecords;
+    return sdr::SdrView(record.data(), record.size()).recordId();
 }
 
 // The record a Get SDR names (0x0000: the first one), or records.size().
@@ -70,9 +69,8 @@ uint16_t freeSpace(const SdrModel& m) {
 }
 
 bool isSensorRecord(const std::vector<uint8_t>& record) {
-    if (record.size() < kHeaderBytes) return false;
-    const uint8_t type = record[3];
-    return type == 0x01 || type == 0x02 || type == 0x03;
+    const sdr::SdrView r(record.data(), record.size());
+    return r.isFullOrCompact() || r.isEventOnly();
 }
 
 uint16_t grantReservation(SdrModel& m) {
@@ -161,9 +159,9 @@ void loadSdrDump(Bmc& bmc, const std::string& path) {
     std::vector<std::vector<uint8_t>> records;
     size_t at = 0;
     while (at < bytes.size()) {
-        if (bytes.size() - at < kHeaderBytes)
+        if (bytes.size() - at < sdr::header::length)
             throw std::runtime_error(path + ": record header cut short at byte " + std::to_string(at));
-        const size_t size = kHeaderBytes + bytes[at + kHeaderLength];
+        const size_t size = sdr::header::length + bytes[at + sdr::header::remainingLength];
         if (bytes.size() - at < size)
             throw std::runtime_error(path + ": record cut short at byte " + std::to_string(at));
         records.emplace_back(bytes.begin() + static_cast<long>(at), bytes.begin() + static_cast<long>(at + size));

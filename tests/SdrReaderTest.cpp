@@ -44,21 +44,21 @@ struct Shared {
 
 // A compact sensor record (type 0x02) sharing its description.
 Bytes compactRecord(uint16_t id, const Shared& s) {
-    Bytes r = sdrRecord(id, 0x02, 40);
-    r[7] = s.number;
-    r[9] = s.instanceByte;
-    r[23] = static_cast<uint8_t>(0x10 | s.shareCount);  // modifier type 1 (alpha)
-    r[24] = s.modifierByte;
+    Bytes r = sdrRecord(id, sdr::type::compactSensor, 40);
+    r[sdr::key::sensorNumber] = s.number;
+    r[sdr::key::entityInstance] = s.instanceByte;
+    r[sdr::compact::sharing] = static_cast<uint8_t>(0x10 | s.shareCount);  // modifier type 1 (alpha)
+    r[sdr::compact::instanceModifier] = s.modifierByte;
     return r;
 }
 
 // An event-only record (type 0x03) sharing its description.
 Bytes eventOnlyRecord(uint16_t id, const Shared& s) {
-    Bytes r = sdrRecord(id, 0x03, 20);
-    r[7] = s.number;
-    r[9] = s.instanceByte;
-    r[12] = s.shareCount;
-    r[13] = s.modifierByte;
+    Bytes r = sdrRecord(id, sdr::type::eventOnly, 20);
+    r[sdr::key::sensorNumber] = s.number;
+    r[sdr::key::entityInstance] = s.instanceByte;
+    r[sdr::eventOnly::sharing] = s.shareCount;
+    r[sdr::eventOnly::instanceModifier] = s.modifierByte;
     return r;
 }
 
@@ -613,11 +613,11 @@ TEST_F(SdrReader, CompactRecordSharingThreeSensorsYieldsThree) {
         EXPECT_EQ(f.recordId, 0x40);
         EXPECT_EQ(f.recordType, 0x02);
         ASSERT_EQ(f.bytes.size(), record.size());
-        EXPECT_EQ(f.bytes[7], numbers[i]);
-        EXPECT_EQ(f.bytes[9], instances[i]);
-        EXPECT_EQ(f.bytes[24], modifiers[i]);
-        EXPECT_EQ(f.bytes[23], 0x10 | (3 - i));
-        EXPECT_EQ(f.bytes[30], record[30]);  // the rest is the record's
+        EXPECT_EQ(f.bytes[sdr::key::sensorNumber], numbers[i]);
+        EXPECT_EQ(f.bytes[sdr::key::entityInstance], instances[i]);
+        EXPECT_EQ(f.bytes[sdr::compact::instanceModifier], modifiers[i]);
+        EXPECT_EQ(f.bytes[sdr::compact::sharing], 0x10 | (3 - i));
+        EXPECT_EQ(f.bytes[sdr::compact::oem], record[sdr::compact::oem]);  // the rest is the record's
     }
 }
 
@@ -630,16 +630,16 @@ TEST_F(SdrReader, EventOnlyRecordSharingKeepsTheInstanceUnlessAsked) {
     const auto filed = list(SDR_GROUP_EVENT_ONLY);
     ASSERT_EQ(filed.size(), 2u);
     EXPECT_EQ(filed[1].bytes, record);
-    EXPECT_EQ(filed[0].bytes[7], 0x51);
-    EXPECT_EQ(filed[0].bytes[9], 0x02);
-    EXPECT_EQ(filed[0].bytes[12], 1);
-    EXPECT_EQ(filed[0].bytes[13], 0x06);
+    EXPECT_EQ(filed[0].bytes[sdr::key::sensorNumber], 0x51);
+    EXPECT_EQ(filed[0].bytes[sdr::key::entityInstance], 0x02);
+    EXPECT_EQ(filed[0].bytes[sdr::eventOnly::sharing], 1);
+    EXPECT_EQ(filed[0].bytes[sdr::eventOnly::instanceModifier], 0x06);
 }
 
 TEST_F(SdrReader, SharedRecordTooShortForItsSharingBytesIsFiledAlone) {
     Bytes record = compactRecord(0x42, Shared{0x10, 1, 5, 0});
-    record.resize(24);  // ends at the sharing byte, without the modifier byte
-    record[4] = 19;
+    record.resize(sdr::compact::instanceModifier);  // ends with the sharing byte
+    record[sdr::header::remainingLength] = static_cast<uint8_t>(record.size() - sdr::header::length);
     setRepository({record});
 
     ASSERT_EQ(IpmiIfcSdrGetInfo(0), 0u);
