@@ -225,19 +225,6 @@ TEST_F(SdrReader, FullLoadMakesExactlyTheExchangesTheWalkNeeds) {
     EXPECT_EQ(walk, (std::vector<ChunkRead>{{r, 0, 0, 5}, {r, 2, 0, 5}, {r, 3, 0, 5}}));
 }
 
-TEST_F(SdrReader, DefaultProfileLoadMakesExactlyTheExchangesTheWalkNeeds) {
-    useBmc(Sim::loadProfile(Sim::defaultProfilePath()));
-    sim().resetCounters();
-    size_t chunks = 0;
-    for (const auto& r : bmc().sdr.records) chunks += chunkReads(r.size());
-
-    ASSERT_EQ(IpmiIfcSdrGetInfo(0), 0u);
-
-    EXPECT_EQ(sim().exchanges(netfn::storage, cmd::getSdrRepositoryInfo), 1u);
-    EXPECT_EQ(sim().exchanges(netfn::storage, cmd::reserveSdrRepository), 1u);
-    EXPECT_EQ(sim().exchanges(netfn::storage, cmd::getSdr), bmc().sdr.records.size() + chunks);
-}
-
 TEST_F(SdrReader, GetSdrHandsOutTheStoredInfo) {
     setRepository({sdrRecord(1, 0x01, 30), sdrRecord(2, 0x02, 30)});
     bmc().sdr.additionTimestamp = 0x11223344;
@@ -548,11 +535,6 @@ TEST_F(SdrReader, RecordGoneAfterTheWalkIsSkippedAndTheRestFiled) {
     EXPECT_EQ(log.count("IpmiIfcSdrReadRecordId: retry expired."), 0u);
 }
 
-TEST_F(SdrReader, ReadAllWithoutHeadersIsRefused) {
-    EXPECT_EQ(IpmiIfcSdrReadAll(0), kFailed);
-    EXPECT_TRUE(log.contains(LOG_ERR, "IpmiIfcSdrReadAll: header_cnt == 0 or no header data"));
-}
-
 // ---------------------------------------------------------------------------
 // The header walk
 
@@ -744,6 +726,7 @@ TEST_F(SdrReader, CleanUpEmptiesEveryListAndTheHeaders) {
     EXPECT_EQ(filedCount(), 0u);
     EXPECT_EQ(node().work.sdr.headers, nullptr);
     EXPECT_EQ(IpmiIfcSdrReadAll(0), kFailed);
+    EXPECT_TRUE(log.contains(LOG_ERR, "IpmiIfcSdrReadAll: header_cnt == 0 or no header data"));
 }
 
 // ---------------------------------------------------------------------------
