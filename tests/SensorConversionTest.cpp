@@ -8,7 +8,6 @@
 #include <fstream>
 #include <iterator>
 #include <map>
-#include <regex>
 
 #include "CmpiStatus.h"
 #include "IpmiSensor.h"
@@ -251,43 +250,99 @@ TEST(SensorRecord, DumpPrintsTheRecordSixteenBytesALine) {
               testing::internal::GetCapturedStdout());
 }
 
-// Full records of real servers: nominal and normal range as ipmitool decodes them.
-TEST(SensorConversion, RealRecordsMatchIpmitool) {
-    const std::string base = TestSupport::realDataPath("sdr/infrasim_dell_r630.sdr");
-    SKIP_WITHOUT_REAL_DATA(base);
-    std::ifstream in(base, std::ios::binary);
-    std::vector<uint8_t> all((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
-    std::ifstream refIn(TestSupport::realDataPath("sdr/infrasim_dell_r630.ipmitool-sdr-v.txt"));
-    std::string reference((std::istreambuf_iterator<char>(refIn)), std::istreambuf_iterator<char>());
+std::vector<uint8_t> readFile(const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    return std::vector<uint8_t>((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+}
 
-    int compared = 0;
+// Calls fn(bytes, length) for each whole record of an SDR dump.
+template <class Fn>
+void forEachRecord(const std::vector<uint8_t>& all, Fn fn) {
     for (size_t at = 0; at + sdr::header::length <= all.size();) {
         const size_t length = sdr::header::length + all[at + sdr::header::remainingLength];
         if (at + length > all.size()) break;
-        IpmiThresholdSensor s(0, &all[at], static_cast<int>(length));
-        const sdr::FullSensorView view(&all[at], length);
+        fn(&all[at], length);
         at += length;
-        if (!view.isFull() || view.linearisation() != 0 || !s.isConvertible()) continue;
-        const std::string id(reinterpret_cast<const char*>(view.bytes() + view.idStringOffset),
-                             std::min<size_t>(view.idStringCode().length(), length - view.idStringOffset));
-        char key[64];
-        snprintf(key, sizeof key, "Sensor ID              : %s (0x%x)\n", id.c_str(), view.sensorNumber());
-        const size_t block = reference.find(key);
-        if (block == std::string::npos) continue;
-        const std::string text = reference.substr(block, reference.find("\n\n", block) - block);
-        std::smatch m;
-        if (std::regex_search(text, m, std::regex("Normal Minimum +: (-?[0-9.]+)"))) {
-            EXPECT_NEAR(std::stod(m[1]), s.getNormalMin(), 0.0005) << id;
-        }
-        if (std::regex_search(text, m, std::regex("Normal Maximum +: (-?[0-9.]+)"))) {
-            EXPECT_NEAR(std::stod(m[1]), s.getNormalMax(), 0.0005) << id;
-        }
-        if (std::regex_search(text, m, std::regex("Nominal Reading +: (-?[0-9.]+)"))) {
-            EXPECT_NEAR(std::stod(m[1]), s.getNominalReading(), 0.0005) << id;
-            ++compared;
-        }
     }
-    EXPECT_GT(compared, 5);
+}
+
+// The number ipmitool prints after "<field>   : " in one sensor's block.
+bool ipmitoolValue(const std::string& block, const std::string& field, double& value) {
+    const size_t at = block.find("\n " + field + " ");
+    if (at == std::string::npos) return false;
+    const size_t colon = block.find(": ", at);
+    if (colon == std::string::npos) return false;
+    char* end = nullptr;
+    value = strtod(block.c_str() + colon + 2, &end);
+    return end != block.c_str() + colon + 2 && (*end == '\n' || *end == '\0');
+}
+
+const char* const kRealSdrSets[] = {"infrasim_dell_c6320", "infrasim_dell_r630", "infrasim_dell_r640",
+                                    "infrasim_dell_r730",  "infrasim_s2600kp",   "infrasim_s2600tp",
+                                    "infrasim_s2600wtt",   "infrasim_vnode",     "openipmi_marvell_axp_sdrcomp",
+                                    "rawsel_ast2500_intel2s"};
+
+// Full records of real servers: nominal reading and normal range as ipmitool decodes them.
+TEST(SensorConversion, RealRecordsMatchIpmitool) {
+    SKIP_WITHOUT_REAL_DATA(TestSupport::realDataPath("sdr/infrasim_dell_r630.sdr"));
+    int compared = 0;
+    for (const char* set : kRealSdrSets) {
+        const std::string base = TestSupport::realDataPath(std::string("sdr/") + set + ".sdr");
+        const std::vector<uint8_t> refBytes = readFile(TestSupport::realDataPath(std::string("sdr/") + set + ".ipmitool-sdr-v.txt"));
+        const std::string reference(refBytes.begin(), refBytes.end());
+        forEachRecord(readFile(base), [&](const uint8_t* bytes, size_t length) {
+            IpmiThresholdSensor s(0, const_cast<uint8_t*>(bytes), static_cast<int>(length));
+            const sdr::FullSensorView view(bytes, length);
+            if (!view.isFull() || view.linearisation() != 0 || !s.isConvertible()) return;
+            const size_t idLength = std::min<size_t>(view.idStringCode().length(), length - view.idStringOffset);
+            const std::string id(reinterpret_cast<const char*>(bytes + view.idStringOffset), idLength);
+            const std::string key = "Sensor ID              : " + id + " (0x" + [&] {
+                char hex[8];
+                snprintf(hex, sizeof hex, "%x", view.sensorNumber());
+                return std::string(hex);
+            }() + ")\n";
+            const size_t block = reference.find(key);
+            if (block == std::string::npos) return;
+            const std::string text = reference.substr(block, reference.find("\n\n", block) - block);
+            const std::pair<const char*, double> fields[] = {{"Normal Minimum", s.getNormalMin()},
+                                                             {"Normal Maximum", s.getNormalMax()},
+                                                             {"Nominal Reading", s.getNominalReading()}};
+            for (const auto& f : fields) {
+                double printed = 0;
+                if (!ipmitoolValue(text, f.first, printed)) continue;
+                EXPECT_NEAR(printed, f.second, 0.00051) << set << " " << id << " " << f.first;
+                ++compared;
+            }
+        });
+    }
+    EXPECT_GT(compared, 100);
+}
+
+// Every record of every real repository, whatever its type, answers every
+// record question without reading outside its bytes.
+TEST(SensorRecord, RealRecordsOfEveryTypeAreReadSafely) {
+    SKIP_WITHOUT_REAL_DATA(TestSupport::realDataPath("sdr/infrasim_dell_r630.sdr"));
+    LogCapture quiet;
+    int records = 0;
+    for (const char* set : kRealSdrSets) {
+        forEachRecord(readFile(TestSupport::realDataPath(std::string("sdr/") + set + ".sdr")),
+                      [&](const uint8_t* bytes, size_t length) {
+                          for (size_t cut : {length, length / 2, size_t{3}}) {
+                              IpmiDiscreteSensor s(0, const_cast<uint8_t*>(bytes), static_cast<int>(cut));
+                              unsigned sum = s.getOwnerId() + s.getLun() + s.getChannel() + s.getSensorType() +
+                                             s.getEventReadingType() + s.getRateUnit() + s.getBaseUnit() +
+                                             s.getModifierUnit() + s.getModifierUnitUse() + s.getSensorDirection() +
+                                             s.getHysteresisSupport() + s.getEventMessageSupport() + s.getFlags() +
+                                             s.getAssertionEventMask() + s.getDeassertionEventMask() +
+                                             s.getReadingMask() + s.getEntity().id;
+                              sum += s.isAnalog() + s.isLinear() + s.isNominalReadingSet() + s.isNormalMaxSet();
+                              if (s.isConvertible()) sum += s.convertToRawValue(s.getMaxReadable()) & 1;
+                              EXPECT_GE(sum, 0u);
+                          }
+                          ++records;
+                      });
+    }
+    EXPECT_GT(records, 500);
 }
 
 }  // namespace
