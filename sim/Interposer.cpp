@@ -21,13 +21,31 @@
 
 #include "Sim.h"
 
+extern "C" {
+__attribute__((weak)) extern const int tavIpmiSimPreloaded;
+}
+
 namespace {
 
 // The next definition of a C-library function: a sanitizer's interceptor when
 // one is loaded (so it keeps its bookkeeping), else the C library's own.
+// In the preload library (Preload.cpp defines this) a sanitizer runtime
+// comes first in the lookup order, so its interceptors already call these
+// functions as their "next" one: from there they go straight to the C library.
+//
+// Nothing here allocates: preloaded into a sanitized program, the first call
+// can come from inside the sanitizer's allocator (its clock_gettime) while it
+// holds its lock.
 void* nextSymbol(const char* name) {
-    std::string intercepted = std::string("__interceptor_") + name;
-    void* fn = dlsym(RTLD_DEFAULT, intercepted.c_str());
+    static const char kPrefix[] = "__interceptor_";
+    char intercepted[64];
+    size_t length = strlen(name);
+    void* fn = nullptr;
+    if (&tavIpmiSimPreloaded == nullptr && length < sizeof intercepted - (sizeof kPrefix - 1)) {
+        memcpy(intercepted, kPrefix, sizeof kPrefix - 1);
+        memcpy(intercepted + sizeof kPrefix - 1, name, length + 1);
+        fn = dlsym(RTLD_DEFAULT, intercepted);
+    }
     if (fn == nullptr) fn = dlsym(RTLD_NEXT, name);
     return fn;
 }

@@ -11,6 +11,9 @@
 #include "Bmc.h"
 #include "Sim.h"
 
+// Tells the interposer that it lives in the preload library.
+extern "C" const int tavIpmiSimPreloaded = 1;
+
 namespace {
 
 __attribute__((constructor)) void installFromEnvironment() {

@@ -54,9 +54,9 @@ const std::map<std::string, uint8_t> kEventSupportNames = {
 
 // ipmi_sim commands that the model has no place for: read and skipped.
 const std::set<std::string> kSkippedCommands = {
-    "quit",         "sleep",        "debug",           "read_cmds",        "device_sdr_add", "sel_add",
-    "mc_set_guid",  "mc_dump_fru_data", "mc_set_power", "mc_set_num_leds", "mc_new_event",   "atca_enable",
-    "atca_set_site", "set_working_mc"};
+    "quit",         "sleep",           "debug",         "read_cmds",       "set_working_mc",
+    "mc_set_guid",  "mc_dump_fru_data", "mc_set_power", "mc_set_num_leds", "mc_new_event",
+    "sel_add",      "device_sdr_add",  "atca_enable",   "atca_set_site"};
 
 struct Command {
     std::string file;
@@ -139,12 +139,9 @@ private:
     Bmc& bmc_;
     std::map<std::string, std::string> names_;
     std::map<uint8_t, Identity> controllers_;  // other controllers, by IPMB address
-    // What the model does not keep of a sensor's set-up.
-    struct SensorSetup {
-        uint8_t thresholdsEnabled = 0;
-    };
     static uint32_t keyOf(const SensorModel& s) { return uint32_t(s.owner) << 16 | uint32_t(s.lun) << 8 | s.number; }
-    std::map<uint32_t, SensorSetup> extras_;
+    // Thresholds each sensor compares against, readable or not (the model keeps readable ones).
+    std::map<uint32_t, uint8_t> thresholdsEnabled_;
     std::set<uint8_t> added_;
     std::set<uint8_t> enabled_;
 };
@@ -167,7 +164,8 @@ void ProfileReader::readFile(const std::string& path, int depth) {
         if (c.words.empty()) return;
         if (c.words[0] == "include") {
             needArgs(c, 2, "include \"file\"");
-            if (depth >= kMaxIncludeDepth) throw SyntaxError(c, "includes nested more than 8 deep");
+            if (depth >= kMaxIncludeDepth)
+                throw SyntaxError(c, "includes nested more than " + std::to_string(kMaxIncludeDepth) + " deep");
             std::string target = c.words[1];
             if (target.empty() || target[0] != '/') target = directoryOf(path) + target;
             std::ifstream probe(target);
@@ -477,7 +475,7 @@ void ProfileReader::sensorSetValue(const Command& c) {
     if (record != nullptr) format = sdr::SensorRecordView(record->data(), record->size()).analogDataFormat();
     if (format == sdr::analogFormat::noAnalogReading) return;
     const int reading = signedValue(s.reading, format);
-    const uint8_t enabled = extras_[keyOf(s)].thresholdsEnabled;
+    const uint8_t enabled = thresholdsEnabled_[keyOf(s)];
     for (unsigned i = 0; i < kThresholdCount; ++i) {
         if (!(enabled & (1u << i))) continue;
         const int threshold = signedValue(s.thresholds[i], format);
@@ -508,7 +506,7 @@ void ProfileReader::sensorSetThreshold(const Command& c) {
     for (size_t i = 6; i < c.words.size(); ++i)
         s.thresholds[kThresholdCount - 1 - (i - 6)] = byte(c, i, "threshold value");
     const bool readable = support == kSupportNames.at("readable") || support == kSupportNames.at("settable");
-    extras_[keyOf(s)].thresholdsEnabled = enabled;
+    thresholdsEnabled_[keyOf(s)] = enabled;
     s.readableMask = readable ? enabled : 0;
     s.settableMask = support == kSupportNames.at("settable") ? enabled : 0;
 }
