@@ -252,6 +252,8 @@ struct ReferenceSet {
     const char* profile;  // under the real data directory
 };
 
+void PrintTo(const ReferenceSet& set, std::ostream* os) { *os << set.name; }
+
 const ReferenceSet kReferenceSets[] = {
     {"infrasim_dell_c6320", "sim/infrasim_dell_c6320.emu"},
     {"infrasim_dell_r630", "sim/infrasim_dell_r630.emu"},
