@@ -160,7 +160,7 @@ TEST(SensorConversion, RangeFlagsAreTestedOnlyOnRecordsThatAreNotFull) {
     r[sdr::full::nominalReading] = 8;
     r[sdr::full::sensorMin] = 1;
     r[sdr::full::sensorMax] = 200;
-    auto full = sensorOf(r);  // no "specified" flags set
+    auto full = sensorOf(r);  // no analog characteristic flags set
     EXPECT_DOUBLE_EQ(7.0, full.getNormalMin());
     EXPECT_DOUBLE_EQ(9.0, full.getNormalMax());
     EXPECT_DOUBLE_EQ(8.0, full.getNominalReading());
@@ -169,8 +169,8 @@ TEST(SensorConversion, RangeFlagsAreTestedOnlyOnRecordsThatAreNotFull) {
 
     auto c = compactRecord();
     EXPECT_DOUBLE_EQ(0.0, sensorOf(c).getNormalMin());
-    c[sdr::full::analogFlags] = sdr::bits::normalMinSpecified | sdr::bits::normalMaxSpecified |
-                                sdr::bits::nominalReadingSpecified;
+    c[sdr::full::analogFlags] = sdr::bits::hasNormalMin | sdr::bits::hasNormalMax |
+                                sdr::bits::hasNominalReading;
     EXPECT_THROW(sensorOf(c).getNormalMin(), kelInt::CmpiStatus);
     EXPECT_THROW(sensorOf(c).getNormalMax(), kelInt::CmpiStatus);
     EXPECT_THROW(sensorOf(c).getNominalReading(), kelInt::CmpiStatus);

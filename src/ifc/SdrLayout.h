@@ -132,9 +132,9 @@ constexpr uint8_t autoRearm = 0x40;
 // units 1 byte
 constexpr uint8_t percentage = 0x01;
 // analog characteristic flags
-constexpr uint8_t nominalReadingSpecified = 0x01;
-constexpr uint8_t normalMaxSpecified = 0x02;
-constexpr uint8_t normalMinSpecified = 0x04;
+constexpr uint8_t hasNominalReading = 0x01;
+constexpr uint8_t hasNormalMax = 0x02;
+constexpr uint8_t hasNormalMin = 0x04;
 // sharing / instance modifier bytes
 constexpr uint8_t shareCount = 0x0F;
 constexpr uint8_t entityInstanceIncrements = 0x80;
@@ -302,11 +302,11 @@ class FullSensorView : public SensorRecordView {
   constexpr int bExp() const { return signExtend(byteAt(full::exponents) & 0x0F, 4); }
 
   constexpr uint8_t analogFlags() const { return byteAt(full::analogFlags); }
-  constexpr bool nominalReadingSpecified() const {
-    return analogFlags() & bits::nominalReadingSpecified;
+  constexpr bool hasNominalReading() const {
+    return analogFlags() & bits::hasNominalReading;
   }
-  constexpr bool normalMaxSpecified() const { return analogFlags() & bits::normalMaxSpecified; }
-  constexpr bool normalMinSpecified() const { return analogFlags() & bits::normalMinSpecified; }
+  constexpr bool hasNormalMax() const { return analogFlags() & bits::hasNormalMax; }
+  constexpr bool hasNormalMin() const { return analogFlags() & bits::hasNormalMin; }
   constexpr uint8_t nominalReading() const { return byteAt(full::nominalReading); }
   constexpr uint8_t normalMax() const { return byteAt(full::normalMax); }
   constexpr uint8_t normalMin() const { return byteAt(full::normalMin); }

@@ -227,17 +227,17 @@ bool IpmiSensor::isConvertible() const {
 
 bool IpmiSensor::isNominalReadingSet() const {
     const auto rec = recordOf(recordBytes(), readableLength());
-    return rec.isFull() && rec.nominalReadingSpecified();
+    return rec.isFull() && rec.hasNominalReading();
 }
 
 bool IpmiSensor::isNormalMaxSet() const {
     const auto rec = recordOf(recordBytes(), readableLength());
-    return rec.isFull() && rec.normalMaxSpecified();
+    return rec.isFull() && rec.hasNormalMax();
 }
 
 bool IpmiSensor::isNormalMinSet() const {
     const auto rec = recordOf(recordBytes(), readableLength());
-    return rec.isFull() && rec.normalMinSpecified();
+    return rec.isFull() && rec.hasNormalMin();
 }
 
 bool IpmiSensor::readingStateUnavailable() const {
@@ -485,25 +485,25 @@ double IpmiSensor::getMaxReadable() const {
     return convertRawValue(rec.sensorMax());
 }
 
-// The next three test the "specified" flag only for records that are not
+// The next three test the analog characteristic flag only for records that are not
 // full, and a full record converts its byte whatever the flag says. Kept.
 double IpmiSensor::getNormalMin() const {
     const auto rec = recordOf(recordBytes(), readableLength());
-    if (!rec.isFull() && rec.normalMinSpecified())
+    if (!rec.isFull() && rec.hasNormalMin())
         throw kelInt::CmpiStatus(CMPI_RC_ERR_FAILED, "Not a Full sensor or available");
     return convertRawValue(rec.normalMin());
 }
 
 double IpmiSensor::getNormalMax() const {
     const auto rec = recordOf(recordBytes(), readableLength());
-    if (!rec.isFull() && rec.normalMaxSpecified())
+    if (!rec.isFull() && rec.hasNormalMax())
         throw kelInt::CmpiStatus(CMPI_RC_ERR_FAILED, "Not a Full sensor or normal max not available");
     return convertRawValue(rec.normalMax());
 }
 
 double IpmiSensor::getNominalReading() const {
     const auto rec = recordOf(recordBytes(), readableLength());
-    if (!rec.isFull() && rec.nominalReadingSpecified())
+    if (!rec.isFull() && rec.hasNominalReading())
         throw kelInt::CmpiStatus(CMPI_RC_ERR_FAILED, "Not a Full sensor or no nominal reading");
     return convertRawValue(rec.nominalReading());
 }
