@@ -7,6 +7,8 @@
 #include <string.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <map>
 #include <string>
 #include <vector>
 
