@@ -306,6 +306,51 @@ TEST_F(EntityTree, RefreshChainBuildsTheTreeOnce) {
     EXPECT_EQ(parentOf(kPowerSupply, 2), EntityKey(kSystemChassis, 1));
 }
 
+// A threshold sensor of the given type and base unit.
+Bytes powerSensor(uint8_t number, uint8_t entityId, uint8_t entityInstance, uint8_t sensorType, uint8_t baseUnit) {
+    Bytes r = sensorRecord(sdr::type::fullSensor, entityId, entityInstance);
+    r[sdr::header::recordId] = number;
+    r[sdr::key::sensorNumber] = number;
+    r[sdr::sensor::sensorType] = sensorType;
+    r[sdr::sensor::eventReadingType] = sdr::eventReadingTypeThreshold;
+    r[sdr::sensor::baseUnit] = baseUnit;
+    return r;
+}
+
+// HPE controllers list power supply bays that hold nothing; only a supply
+// with a Watts power-supply sensor of its own instance is real.
+TEST_F(EntityTree, PhantomPowerSuppliesAreStrippedOnHpeControllers) {
+    constexpr uint8_t kPowerSupplyType = 0x08, kVoltageType = 0x02;
+    constexpr uint8_t kWatts = 6, kAmps = 5;
+    constexpr uint8_t kPowerDistribution = 0x15;
+    bmc().sdr.records = {
+        association(kSystemChassis, 1, 0, {kPowerSupply, 1, kPowerSupply, 2, kPowerSupply, 3, kPowerSupply, 4}),
+        powerSensor(0x10, kPowerSupply, 1, kPowerSupplyType, kWatts),
+        powerSensor(0x11, kPowerSupply, 2, kPowerSupplyType, kAmps),
+        powerSensor(0x12, kPowerSupply, 3, kVoltageType, kWatts),
+        powerSensor(0x13, kPowerDistribution, 4, kPowerSupplyType, kWatts),  // right sensor, other entity
+        powerSensor(0x14, kPowerSupply, 0x85, kPowerSupplyType, kWatts),     // device-relative instance 5
+    };
+    struct Restore {
+        ~Restore() { IpmiIfc::hpe_bmc = false; }
+    } restore;
+
+    ASSERT_EQ(IpmiIfcSdrGetInfo(0), 0u);
+    ASSERT_EQ(IpmiIfc::getSensors().size(), 5u);
+    EXPECT_THAT(entities(), ElementsAre(Pair(kSystemChassis, 1), Pair(kPowerSupply, 1), Pair(kPowerSupply, 2),
+                                        Pair(kPowerSupply, 3), Pair(kPowerSupply, 4), Pair(kPowerSupply, 5),
+                                        Pair(kPowerDistribution, 4)));
+    EXPECT_EQ(log.count("IpmiIfcEntityInstantiateAll: stripping out phantom power supply IPMI SDRs"), 0u);
+
+    IpmiIfc::hpe_bmc = true;
+    ASSERT_EQ(IpmiIfcSdrGetInfo(0), 0u);
+    EXPECT_THAT(entities(), ElementsAre(Pair(kSystemChassis, 1), Pair(kPowerSupply, 1), Pair(kPowerSupply, 5),
+                                        Pair(kPowerDistribution, 4)));
+    EXPECT_TRUE(log.contains(LOG_INFO, "IpmiIfcEntityInstantiateAll: stripping out phantom power supply IPMI SDRs"));
+    // The tree itself keeps them: only the list handed to callers is stripped.
+    EXPECT_EQ(parentOf(kPowerSupply, 2), EntityKey(kSystemChassis, 1));
+}
+
 // OpenIPMI's Marvell board: chassis and blades with association records,
 // read from a simulated controller.
 TEST_F(EntityTree, RealRepositoryWithAssociationRecords) {

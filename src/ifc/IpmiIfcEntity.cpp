@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "IpmiIfcInternal.h"
+#include "IpmiSensor.h"
 #include "SdrLayout.h"
 
 namespace Ipmi {
@@ -27,6 +28,12 @@ constexpr size_t rangeSize = 4;  // first ID, first instance, last ID, last inst
 constexpr uint8_t flagRanges = 0x80;
 constexpr uint8_t flagPresenceAccessible = 0x20;
 }  // namespace assoc
+
+// Only power supplies reported with a Watts power-supply sensor are real on
+// HPE controllers; their repositories list empty bays as well.
+constexpr uint8_t kEntityPowerSupply = 0x0A;
+constexpr uint8_t kSensorTypePowerSupply = 0x08;
+constexpr uint8_t kUnitWatts = 6;
 
 bool validNode(int node) { return node >= 0 && node < IPMI_NODE_COUNT; }
 
@@ -69,6 +76,26 @@ void addAssociation(int node, const sdr::SdrView& record) {
         if (!record.has(at, assoc::pairSize)) break;
         if (record.byteAt(at) != 0) IpmiIfcEntityAddChild(node, &container, record.byteAt(at), record.byteAt(at + 1));
     }
+}
+
+bool hasWattsSensor(const std::vector<std::shared_ptr<IpmiSensor>>& sensors, unsigned instance) {
+    for (const auto& s : sensors) {
+        if (!s) continue;
+        const IpmiEntity e = s->getEntity();
+        if (e.id == kEntityPowerSupply && e.instance == instance && s->getSensorType() == kSensorTypePowerSupply &&
+            s->getBaseUnit() == kUnitWatts)
+            return true;
+    }
+    return false;
+}
+
+// Walks from the end so that removals do not move the entries still to be seen.
+void stripPhantomPowerSupplies(const std::vector<std::shared_ptr<IpmiSensor>>& sensors,
+                               std::vector<IpmiEntity>& entities) {
+    ipmiLog(LOG_INFO, "%s: stripping out phantom power supply IPMI SDRs", "IpmiIfcEntityInstantiateAll");
+    for (size_t i = entities.size(); i-- > 0;)
+        if (entities[i].id == kEntityPowerSupply && !hasWattsSensor(sensors, entities[i].instance))
+            entities.erase(entities.begin() + static_cast<std::ptrdiff_t>(i));
 }
 
 void addSensorEntity(int node, const sdr::SdrView& record) {
@@ -161,15 +188,21 @@ uint32_t IpmiIfcEntityInstantiate(int node, const ipmiifc_entity_list* element) 
     return 0;
 }
 
-// Lock order: the entity mutex, then cacheLock (taken by getSensors).
+// The sensor copy is taken before the entity mutex: the tree builder holds
+// cacheLock while it takes the entity mutex, so the reverse nesting here would
+// close a lock-order cycle (harmless while one thread runs both, but a trap).
 uint32_t IpmiIfcEntityInstantiateAll(int node) {
     if (!validNode(node)) return kFail;
     IpmiNode& n = g_IpmiNode[node];
-    TAV::MutexLock guard(n.entityMutex);
     try {
+        const bool stripPhantoms = IpmiIfc::hpe_bmc;
+        const std::vector<std::shared_ptr<IpmiSensor>> sensors =
+            stripPhantoms ? IpmiIfc::getSensors(node) : std::vector<std::shared_ptr<IpmiSensor>>();
+        TAV::MutexLock guard(n.entityMutex);
         n.entities.clear();
         for (const ipmiifc_entity_list* e = n.work.entity_tree; e != nullptr; e = e->next)
             IpmiIfcEntityInstantiate(node, e);
+        if (stripPhantoms) stripPhantomPowerSupplies(sensors, n.entities);
     } catch (const std::bad_alloc&) {
         return kFail;
     }
