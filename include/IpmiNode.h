@@ -4,6 +4,7 @@
 #include <pthread.h>
 #include <stdint.h>
 
+#include <atomic>
 #include <list>
 #include <memory>
 #include <vector>
@@ -104,7 +105,7 @@ public:
     TAV::Mutex pollMutex;
     pthread_cond_t pollCond;
     int32_t pollInterval;  // units of 16 seconds; <= 0: wait for a signal
-    bool stopRequested;
+    std::atomic<bool> stopRequested;  // set by stop() while the loop and senders test it
     int32_t pollCount;
     int32_t pollType;
     pthread_rwlock_t cacheLock;

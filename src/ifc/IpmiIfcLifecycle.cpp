@@ -13,6 +13,7 @@
 #include <sys/time.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <vector>
 
 #include "IpmiIfcInternal.h"
@@ -36,9 +37,8 @@ constexpr int kStillWaitingEvery = 500;
 constexpr int kNodesPerFullPoll = 8;
 constexpr unsigned char kWakeByte = 255;
 
-// stop() sets the flag from another thread without a lock; every reader here
-// tests it atomically.
-bool stopping(IpmiNode& n) { return __atomic_load_n(&n.stopRequested, __ATOMIC_ACQUIRE); }
+// stop() sets the flag from another thread without a lock.
+bool stopping(IpmiNode& n) { return n.stopRequested.load(std::memory_order_acquire); }
 
 int intervalOf(IpmiNode& n) { return __atomic_load_n(&n.pollInterval, __ATOMIC_RELAXED); }
 
@@ -305,7 +305,7 @@ void IpmiIfc::stop(int) {
     IpmiNode& n = g_IpmiNode[0];
     if (stopping(n)) throw kelInt::CmpiStatus(CMPI_RC_ERROR, "IpmiIfc::stop called twice");
     ipmiLog(LOG_DEBUG, "Node %d: IpmiIfc shutting down", 0);
-    __atomic_store_n(&n.stopRequested, true, __ATOMIC_RELEASE);
+    n.stopRequested.store(true, std::memory_order_release);
 
     if (waitState(0, IPMI_STATE_RUNNING | IPMI_STATE_STOPPED) == IPMI_STATE_RUNNING) {
         // Wake the loop's own exchange first, so that its pass ends at once;
