@@ -94,6 +94,7 @@ protected:
     void TearDown() override {
         IpmiIfcSdrCleanUpAll(0);
         IpmiIfcSdrCleanUpHeaders(0);
+        IpmiIfcEntityCleanUpAll(0);  // the tree the refresh chain built
         IpmiIfcSensorInstantiateAll(0);  // no records left: empties the list
         SimTest::TearDown();
     }
