@@ -35,8 +35,13 @@ uint32_t le32(const uint8_t* b) {
 }
 
 // Entries that unregistering cut out of the list together with the one asked
-// for (see unRegisterSelEventHandler); freed with the list at clean-up.
-std::vector<ipmiifc_sel_handler*> droppedHandlers;
+// for (see unRegisterSelEventHandler). They stay allocated until the list's
+// clean-up, so that a walk of the list that reached one can still go on.
+// Never destroyed: the clean-up may run during process exit.
+std::vector<ipmiifc_sel_handler*>& droppedHandlers() {
+    static auto* dropped = new std::vector<ipmiifc_sel_handler*>();
+    return *dropped;
+}
 
 // Where new SEL records will be read and delivered to the handlers: called
 // with the stored stamps before and after each accepted Get SEL Info answer.
@@ -128,7 +133,7 @@ int IpmiIfc::unRegisterSelEventHandler(int, IpmiSelEventHandler handler) {
     }
     for (ipmiifc_sel_handler* e = head->next; e; e = e->next) {
         if (e->handler != handler) continue;
-        for (ipmiifc_sel_handler* cut = head->next; cut != e; cut = cut->next) droppedHandlers.push_back(cut);
+        for (ipmiifc_sel_handler* cut = head->next; cut != e; cut = cut->next) droppedHandlers().push_back(cut);
         head->next = e->next;
         delete e;
         return kHandlerOk;
@@ -146,8 +151,8 @@ void IpmiIfcSelCleanUpEventHandlers(int node) {
         delete e;
     }
     if (&n == &g_IpmiNode[0]) {
-        for (ipmiifc_sel_handler* e : droppedHandlers) delete e;
-        droppedHandlers.clear();
+        for (ipmiifc_sel_handler* e : droppedHandlers()) delete e;
+        droppedHandlers().clear();
     }
 }
 
