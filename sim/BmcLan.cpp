@@ -58,7 +58,6 @@ bool answersLan(const Bmc& b, uint8_t number) {
 
 Response ipv6StaticAddress(const Bmc& b, uint8_t selector) {
     const auto& list = b.lan.ipv6StaticAddresses;
-    if (list.empty()) return ccOnly(cc::parameterNotSupported);
     if (selector >= list.size()) return ccOnly(cc::parameterOutOfRange);
     const LanIpv6StaticAddress& a = list[selector];
     Response out{cc::ok, kParameterRevision, selector, a.source};

@@ -18,10 +18,9 @@
 
 #include "IpmiIfcInternal.h"
 #include "IpmiLan.h"
+#include "IpmiMapper.h"
 
 namespace Ipmi {
-
-bool LoadSensorHealthDataFile();
 
 int SKIP_SDR_STEP = 30;
 int SKIP_FRU_STEP = 30;
@@ -154,7 +153,7 @@ void readSelCount(IpmiNode& n, LoopState& s) {
     ipmiLog(LOG_WARNING, "Could not get SEL info for node %d after %d tries", 0, kSelInfoTries);
 }
 
-void refreshFru(IpmiNode&) {
+void refreshFru() {
     ipmiLog(LOG_DEBUG, "IpmiIfc::poll - Refreshing FRU");
     IpmiIfcFruInstantiateAll(0);
 }
@@ -204,10 +203,10 @@ PassEnd runPass(IpmiNode& n, LoopState& s) {
     callHandlersWithoutRecord(n);
 
     if (s.fullRefresh) {
-        refreshFru(n);
+        refreshFru();
         if (stopping(n)) return PassEnd::Stop;
     } else if (++s.sdrCycle % skipStep(&SKIP_FRU_STEP) == 1) {
-        refreshFru(n);
+        refreshFru();
         if (stopping(n)) return PassEnd::Stop;
     }
 
