@@ -72,10 +72,13 @@ Row thresholdRow(Ipmi::IpmiSensor& sensor) {
         const std::string unit = sensor.getBaseUnitString();
         if (!unit.empty()) row.reading += " " + unit;
     }
-    try {
-        row.status = thresholdStateText(sensor.getState(false));
-    } catch (const std::exception&) {
-        row.status = "na";
+    // An absent sensor's state reads as "ok" from its empty answer: say nothing instead.
+    row.status = "na";
+    if (!sensor.readingStateUnavailable()) {
+        try {
+            row.status = thresholdStateText(sensor.getState(false));
+        } catch (const std::exception&) {
+        }
     }
     row.health = healthText(sensor);
     return row;
