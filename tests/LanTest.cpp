@@ -174,10 +174,4 @@ TEST_F(Lan, ControllerWithoutIpv6NeverLogsAboutIt) {
     EXPECT_EQ(log.lines().size(), 0u) << log.dump();
 }
 
-TEST_F(Lan, EachNodeSlotHasItsOwnSettings) {
-    EXPECT_EQ(IpmiIfc::getLan(), IpmiIfc::getLan(0));
-    EXPECT_NE(IpmiIfc::getLan(1), IpmiIfc::getLan(0));
-    EXPECT_EQ(IpmiIfc::getLan(1), &g_IpmiNode[1].lan);
-}
-
 }  // namespace

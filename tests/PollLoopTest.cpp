@@ -205,17 +205,6 @@ TEST_F(PollLoop, PollAllGivesUpWaitingOnShutdown) {
     EXPECT_TRUE(log.contains(LOG_DEBUG, "Shutdown signal received. Returning from IpmiIfc::pollAll()"));
 }
 
-TEST_F(PollLoop, LateLoopIsReported) {
-    std::thread waiter([] {
-        bool shutdown = false;
-        IpmiIfc::pollAll(1, true, IPMI_POLL_NORMAL, &shutdown);
-    });
-    waitUntil([&] { return log.count("Waiting for poll thread for node 0 to start") >= 61; });
-    startLoop(0);
-    waiter.join();
-    EXPECT_EQ(linesStartingWith("Poll thread for node 0 started, but it took "), 1u);
-}
-
 TEST_F(PollLoop, NonePollDoesNothing) {
     startLoop(0);
     pass();
