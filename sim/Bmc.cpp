@@ -1,5 +1,7 @@
 #include "Bmc.h"
 
+#include <algorithm>
+
 #include "IpmiCommands.h"
 
 namespace Sim {
@@ -96,11 +98,14 @@ void Bmc::registerStandardHandlers() {
         if (p == b.systemInfo.end()) return ccOnly(cc::parameterNotSupported);
         uint8_t selector = r.data[2];
         auto block = p->second.blocks.find(selector);
-        Response out{cc::ok, revision, selector};
-        if (block == p->second.blocks.end()) {
-            out.resize(out.size() + 16, 0);
-        } else {
-            out.insert(out.end(), block->second.begin(), block->second.end());
+        // Completion code, revision, set selector, then one 16-byte block.
+        Response out(3 + 16, 0);
+        out[0] = cc::ok;
+        out[1] = revision;
+        out[2] = selector;
+        if (block != p->second.blocks.end()) {
+            size_t n = block->second.size() < 16 ? block->second.size() : 16;
+            std::copy_n(block->second.begin(), n, out.begin() + 3);
         }
         return out;
     });
