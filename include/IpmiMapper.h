@@ -52,6 +52,8 @@ TAV_IPMI_API extern SensorHealthMap sensorHealthMap;           // lines with a n
 // Loads "/etc/sfcb/tav/sensor_health" unless the rules are already loaded.
 // False when the file cannot be opened; a later call tries again.
 TAV_IPMI_API bool LoadSensorHealthDataFile();
+// The same with a rules file kept elsewhere (tools run from a build tree).
+TAV_IPMI_API bool LoadSensorHealthDataFile(const char* path);
 
 // Health state of one discrete sensor from its event/reading type, sensor type
 // and state bits (bit n = offset n asserted).

@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "IpmiIfc.h"
+#include "IpmiMapper.h"
 #include "Views.h"
 
 namespace Tool {
@@ -63,6 +64,15 @@ int reexecSimulated(char** argv, const std::string& profile) {
 #endif
 }
 
+// The rules normally live in /etc; a tool run from its build tree, before
+// installation, uses the copy in the source tree.
+void loadHealthRules() {
+#ifdef TAV_IPMI_SOURCE_HEALTH_FILE
+    if (access("/etc/sfcb/tav/sensor_health", R_OK) != 0 && access(TAV_IPMI_SOURCE_HEALTH_FILE, R_OK) == 0)
+        Ipmi::LoadSensorHealthDataFile(TAV_IPMI_SOURCE_HEALTH_FILE);
+#endif
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -108,6 +118,7 @@ int main(int argc, char** argv) {
         fprintf(stderr, "tavipmi: cannot open /dev/ipmi0: %s\n", strerror(errno));
         return 1;
     }
+    loadHealthRules();
     if (Ipmi::IpmiIfcInitForCLI(0) < 0) {
         fprintf(stderr, "tavipmi: cannot prepare the IPMI interface\n");
         Ipmi::IpmiIfcOpenIpmiClose(0);

@@ -7,9 +7,6 @@
 
 namespace Ipmi {
 
-// LoadSensorHealthDataFile() with another rules file.
-bool LoadSensorHealthDataFile(const char* path);
-
 // Empties healthList and sensorHealthMap so that the next load reads a file again.
 void ResetSensorHealthData();
 
