@@ -7,125 +7,27 @@
 // tools', or where ipmi_sim differs from a real controller, the difference is
 // named in a normalisation below; anything else that differs fails.
 
-#include <dirent.h>
 #include <math.h>
-#include <stdio.h>
 #include <stdlib.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cctype>
-#include <fstream>
 #include <functional>
 #include <map>
 #include <set>
-#include <sstream>
 
 #include "CmpiStatus.h"
 #include "IpmiIfc.h"
 #include "IpmiSensor.h"
+#include "PeerTools.h"
 #include "SdrLayout.h"
 #include "TestSupport.h"
 
 namespace {
 
 using namespace Ipmi;
+using namespace TestSupport;
 using SensorPtr = std::shared_ptr<IpmiSensor>;
-
-// ---------------------------------------------------------------- files
-
-std::string programPath(const std::string& name) {
-    const char* path = getenv("PATH");
-    std::stringstream dirs(path ? path : "/usr/bin:/usr/sbin:/bin:/sbin");
-    std::string dir;
-    while (std::getline(dirs, dir, ':')) {
-        std::string candidate = dir + "/" + name;
-        if (access(candidate.c_str(), X_OK) == 0) return candidate;
-    }
-    for (const char* d : {"/usr/sbin", "/sbin"}) {
-        std::string candidate = std::string(d) + "/" + name;
-        if (access(candidate.c_str(), X_OK) == 0) return candidate;
-    }
-    return std::string();
-}
-
-std::vector<std::string> realFiles(const std::string& dir, const std::string& suffix) {
-    std::vector<std::string> out;
-    const std::string base = TestSupport::realDataPath(dir);
-    if (base.empty()) return out;
-    DIR* d = opendir(base.c_str());
-    if (d == nullptr) return out;
-    while (dirent* e = readdir(d)) {
-        const std::string name = e->d_name;
-        if (name.size() > suffix.size() && name.compare(name.size() - suffix.size(), suffix.size(), suffix) == 0)
-            out.push_back(base + "/" + name);
-    }
-    closedir(d);
-    std::sort(out.begin(), out.end());
-    return out;
-}
-
-std::string readFile(const std::string& path) {
-    std::ifstream in(path);
-    std::stringstream s;
-    s << in.rdbuf();
-    return s.str();
-}
-
-std::string baseName(const std::string& path) {
-    std::string name = path.substr(path.rfind('/') + 1);
-    return name.substr(0, name.find('.'));
-}
-
-std::string quoted(const std::string& s) {
-    std::string out = "'";
-    for (char c : s) out += c == '\'' ? std::string("'\\''") : std::string(1, c);
-    return out + "'";
-}
-
-std::string trim(const std::string& s) {
-    size_t b = s.find_first_not_of(" \t\r\n");
-    if (b == std::string::npos) return std::string();
-    size_t e = s.find_last_not_of(" \t\r\n");
-    return s.substr(b, e - b + 1);
-}
-
-std::vector<std::string> lines(const std::string& text) {
-    std::vector<std::string> out;
-    std::stringstream in(text);
-    std::string line;
-    while (std::getline(in, line)) out.push_back(line);
-    return out;
-}
-
-std::vector<std::string> split(const std::string& s, char sep, size_t maxFields) {
-    std::vector<std::string> out;
-    size_t start = 0;
-    while (out.size() + 1 < maxFields) {
-        size_t at = s.find(sep, start);
-        if (at == std::string::npos) break;
-        out.push_back(s.substr(start, at - start));
-        start = at + 1;
-    }
-    out.push_back(s.substr(start));
-    return out;
-}
-
-// Runs a decoder against the simulated controller loaded with `profile`
-// (virtual time, so unanswered requests cost nothing) and returns its output.
-std::string runAgainstSimulator(const std::string& profile, const std::string& command) {
-    const std::string line = "LD_PRELOAD=" + quoted(TAV_IPMI_PRELOAD_LIB) + " TAV_IPMI_SIM_PROFILE=" +
-                             quoted(profile) + " TAV_IPMI_SIM_VIRTUAL_TIME=1 " + command + " 2>/dev/null";
-    FILE* p = popen(line.c_str(), "r");
-    if (p == nullptr) return std::string();
-    std::string out;
-    char buffer[4096];
-    size_t n;
-    while ((n = fread(buffer, 1, sizeof buffer, p)) > 0) out.append(buffer, n);
-    pclose(p);
-    return out;
-}
 
 // ---------------------------------------------------------------- values
 
@@ -515,11 +417,11 @@ bool leftOutOnPurpose(const std::vector<uint8_t>& record) {
 class LiveDecoders : public DecoderCrossCheck, public ::testing::WithParamInterface<std::string> {};
 
 TEST_P(LiveDecoders, IpmitoolSeesTheSameNamesEntitiesAndReadings) {
-    const std::string ipmitool = programPath("ipmitool");
-    if (ipmitool.empty()) GTEST_SKIP() << "ipmitool is not installed";
+    SKIP_WITHOUT_TOOL("ipmitool");
     const std::vector<Ours> ours = libraryOn(GetParam());
     if (!loadFailure_.empty()) GTEST_SKIP() << "the simulator cannot load this profile: " << loadFailure_;
-    std::vector<ElistRow> rows = parseElist(runAgainstSimulator(GetParam(), ipmitool + " -I open sdr elist all"));
+    std::vector<ElistRow> rows =
+        parseElist(runTool(GetParam(), toolPath("ipmitool"), {"-I", "open", "sdr", "elist", "all"}).out);
     ASSERT_FALSE(rows.empty()) << "ipmitool printed nothing";
 
     size_t compared = 0;
@@ -543,17 +445,12 @@ TEST_P(LiveDecoders, IpmitoolSeesTheSameNamesEntitiesAndReadings) {
 }
 
 TEST_P(LiveDecoders, FreeIpmiSeesTheSameSensorsTypesAndReadings) {
-    const std::string ipmiSensors = programPath("ipmi-sensors");
-    if (ipmiSensors.empty()) GTEST_SKIP() << "FreeIPMI is not installed";
+    SKIP_WITHOUT_TOOL("ipmi-sensors");
     const std::vector<Ours> ours = libraryOn(GetParam());
     if (!loadFailure_.empty()) GTEST_SKIP() << "the simulator cannot load this profile: " << loadFailure_;
-    char cacheDir[] = "/tmp/tav-ipmi-sdr-cache-XXXXXX";
-    ASSERT_NE(mkdtemp(cacheDir), nullptr);
-    const std::string output = runAgainstSimulator(
-        GetParam(), ipmiSensors + " --driver-type=OPENIPMI --sdr-cache-directory=" + cacheDir +
-                        " --quiet-cache --comma-separated-output --no-header-output --non-abbreviated-units"
-                        " --shared-sensors");
-    ASSERT_EQ(system((std::string("rm -rf ") + cacheDir).c_str()), 0);
+    const std::string output = runIpmiSensors(GetParam(), {"--comma-separated-output", "--no-header-output",
+                                                           "--non-abbreviated-units", "--shared-sensors"})
+                                   .out;
     std::vector<CsvRow> rows = parseFreeIpmiCsv(output);
 
     // FreeIPMI lists every reading sensor of the BMC's own, and records of
@@ -593,25 +490,13 @@ INSTANTIATE_TEST_SUITE_P(Profiles, LiveDecoders, ::testing::ValuesIn(allProfiles
 
 // ------------------------------------------------ reference decodings of the real servers
 
-// Repositories with reference decodings; the library reads each through the
-// captured server's profile when there is one (the references were taken
-// from ipmi_sim running it), else through the bare SDR dump.
-std::vector<std::string> referenceSets() {
-    std::vector<std::string> all;
-    for (const auto& f : realFiles("sdr", ".sdr")) all.push_back(f.substr(0, f.size() - 4));
-    return all;
-}
-
 class ReferenceDecodings : public DecoderCrossCheck, public ::testing::WithParamInterface<std::string> {
 protected:
     std::vector<Ours> library() {
-        const std::string emu = TestSupport::realDataPath("sim/" + baseName(GetParam()) + ".emu");
-        return libraryOn(emu.empty() ? GetParam() + ".sdr" : emu);
+        return libraryOn(referenceProfile(GetParam()));
     }
     std::string reference(const std::string& kind) {
-        const std::string path = GetParam() + "." + kind + ".txt";
-        struct stat st;
-        return stat(path.c_str(), &st) == 0 ? readFile(path) : std::string();
+        return readFile(GetParam() + "." + kind + ".txt");
     }
 };
 
@@ -756,33 +641,6 @@ TEST_P(ReferenceDecodings, FreeIpmiVerboseListingAgreesOnThresholdsAndUnits) {
         }
     }
     RecordProperty("values compared", static_cast<int>(compared));
-}
-
-// The entity column of `ipmitool sdr elist`, and its status column for
-// threshold sensors.
-TEST_P(ReferenceDecodings, IpmitoolListAgreesOnEntitiesAndThresholdStatus) {
-    const std::string text = reference("ipmitool-sdr-elist");
-    if (text.empty()) GTEST_SKIP() << "no ipmitool list reference";
-    const std::vector<Ours> ours = library();
-    if (!loadFailure_.empty()) GTEST_SKIP() << "the simulator cannot load this profile: " << loadFailure_;
-    std::vector<ElistRow> rows = parseElist(text);
-
-    size_t matched = 0;
-    int states = 0;
-    for (const Ours& o : ours) {
-        if (!o.firstOfRecord) continue;
-        SCOPED_TRACE(o.name + " #" + std::to_string(o.number));
-        ElistRow* row = findRow(rows, o);
-        ASSERT_NE(row, nullptr) << "ipmitool does not list it";
-        ++matched;
-        EXPECT_EQ(row->entityId, o.entity.id);
-        EXPECT_EQ(row->entityInstance, o.entity.instance);
-        if (!o.analog() || !o.readingPresent || !parsePrinted(row->reading).present) continue;
-        ++states;
-        EXPECT_EQ(row->status, ipmitoolStatus(o.state));
-    }
-    EXPECT_GT(matched, 0u);
-    RecordProperty("states compared", states);
 }
 
 INSTANTIATE_TEST_SUITE_P(RealServers, ReferenceDecodings, ::testing::ValuesIn(referenceSets()),
