@@ -60,6 +60,16 @@ int IpmiIfcRespReuse(ipmiifc_resp* r);
 int IpmiIfcRespDel(ipmiifc_resp** r);
 ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiifc_resp* reuse);
 ipmiifc_resp* IpmiIfcSend(int node, ipmiifc_req* req, int flags);
+// Sends a Sensor/Event command carrying the sensor number alone to the
+// sensor's owner (IPMB address, channel, LUN) instead of node 0's current
+// target. The switch and the request happen under the senders' lock, so no
+// other request leaves for that owner; only the address is put back.
+ipmiifc_resp* IpmiIfcSendToOwner(int node, uint8_t command, uint8_t sensorNumber, uint8_t owner, uint8_t channel,
+                                 uint8_t lun);
+// The raw command's answer rules (IpmiIfc::sendCmd): copies at most *resp_len
+// bytes of a successful answer and returns its code, 0x10 for a short buffer,
+// or 255 without an answer.
+uint8_t IpmiIfcCopyAnswer(const ipmiifc_resp* resp, uint16_t* resp_len, uint8_t* resp_buf);
 ipmiifc_resp* IpmiIfcSendCmd(int node, uint8_t cmd, uint8_t netfn, long ignored, uint16_t data_len,
                              uint8_t* data, int flags);
 

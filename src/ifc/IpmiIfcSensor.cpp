@@ -77,29 +77,8 @@ bool hiddenFromCallers(const IpmiSensor& sensor) {
     return entity == kEntityUnspecified || entity == kEntityBios;
 }
 
-// Sends one Sensor/Event request to the controller that owns the record.
-// The target is switched under devInfoMutex, so that no other sender's request
-// leaves for the sensor's owner; only the address is put back afterwards
-// (channel and LUN matter only next to an IPMB address, which sets all three).
 ipmiifc_resp* sendToOwner(int node, const sdr::SensorKeyView& key, uint8_t command) {
-    IpmiNode& bmc = g_IpmiNode[0];
-    uint8_t sensorNumber = key.sensorNumber();
-    ipmiifc_req req;
-    memset(&req, 0, sizeof req);
-    req.netfn = netfn::sensorEvent;
-    req.cmd = command;
-    req.data_len = 1;
-    req.data = &sensorNumber;
-
-    TAV::MutexLock senders(bmc.devInfoMutex);
-    req.msgid = g_IpmiNode[node].msgCounter++;
-    const uint32_t savedAddress = bmc.targetAddress;
-    bmc.targetAddress = key.ownerId();
-    bmc.targetChannel = key.ownerChannel();
-    bmc.targetLun = key.ownerLun();
-    ipmiifc_resp* resp = IpmiIfcSendWresponse(node, &req, 0, nullptr);
-    bmc.targetAddress = savedAddress;
-    return resp;
+    return IpmiIfcSendToOwner(node, command, key.sensorNumber(), key.ownerId(), key.ownerChannel(), key.ownerLun());
 }
 
 // Copies at most `capacity` answer bytes (completion code first); the rest stays 0.

@@ -293,10 +293,29 @@ ipmiifc_resp* IpmiIfcSendCmd(int node, uint8_t cmd, uint8_t netfn, long, uint16_
     return IpmiIfcSend(node, &req, flags);
 }
 
-uint8_t IpmiIfc::sendCmd(int node, uint8_t cmd, uint8_t netfn, uint16_t data_len, uint8_t* data,
-                         uint16_t* resp_len, uint8_t* resp_buf) {
-    ipmiifc_req req = stampedRequest(cmd, netfn, data_len, data);
-    RespHolder resp(IpmiIfcSend(node, &req, 0));
+ipmiifc_resp* IpmiIfcSendToOwner(int node, uint8_t command, uint8_t sensorNumber, uint8_t owner, uint8_t channel,
+                                 uint8_t lun) {
+    ipmiifc_req req;
+    memset(&req, 0, sizeof req);
+    req.netfn = netfn::sensorEvent;
+    req.cmd = command;
+    req.data_len = 1;
+    req.data = &sensorNumber;
+    IpmiNode& bmc = g_IpmiNode[0];
+    TAV::MutexLock senders(bmc.devInfoMutex);
+    req.msgid = g_IpmiNode[node].msgCounter++;
+    const uint32_t savedAddress = bmc.targetAddress;
+    bmc.targetAddress = owner;
+    bmc.targetChannel = channel;
+    bmc.targetLun = lun;
+    ipmiifc_resp* resp = IpmiIfcSendWresponse(node, &req, 0, nullptr);
+    // Channel and LUN matter only next to an IPMB address, and every request
+    // to an IPMB address sets all three.
+    bmc.targetAddress = savedAddress;
+    return resp;
+}
+
+uint8_t IpmiIfcCopyAnswer(const ipmiifc_resp* resp, uint16_t* resp_len, uint8_t* resp_buf) {
     if (!resp) return 0xFF;
     if (resp->cc != 0) return resp->cc;
     uint16_t count = *resp_len < resp->data_len ? *resp_len : static_cast<uint16_t>(resp->data_len);
@@ -304,6 +323,13 @@ uint8_t IpmiIfc::sendCmd(int node, uint8_t cmd, uint8_t netfn, uint16_t data_len
     bool shortBuffer = *resp_len < resp->data_len;
     *resp_len = count;
     return shortBuffer ? 0x10 : 0;
+}
+
+uint8_t IpmiIfc::sendCmd(int node, uint8_t cmd, uint8_t netfn, uint16_t data_len, uint8_t* data,
+                         uint16_t* resp_len, uint8_t* resp_buf) {
+    ipmiifc_req req = stampedRequest(cmd, netfn, data_len, data);
+    RespHolder resp(IpmiIfcSend(node, &req, 0));
+    return IpmiIfcCopyAnswer(resp.get(), resp_len, resp_buf);
 }
 
 uint8_t IpmiIfc::sendCmd(uint8_t cmd, uint8_t netfn, uint16_t data_len, uint8_t* data, uint16_t* resp_len,

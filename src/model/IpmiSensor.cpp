@@ -294,18 +294,12 @@ void IpmiSensor::getSDReading() {
     memset(reading, 0, sizeof reading);
     const auto rec = recordOf(recordBytes(), readableLength());
     if (!rec.ownerIsSoftware()) {
-        IpmiNode& bmc = g_IpmiNode[0];
-        const uint32_t savedAddress = bmc.targetAddress;
-        bmc.targetAddress = rec.ownerId();
-        bmc.targetChannel = rec.ownerChannel();
-        bmc.targetLun = rec.ownerLun();
-        uint8_t number = sensor_number;
+        // The owner is addressed under the senders' lock: a request another
+        // thread sends meanwhile still goes to its own target.
+        RespHolder resp(IpmiIfcSendToOwner(node, cmd::getSensorReading, sensor_number, rec.ownerId(),
+                                           rec.ownerChannel(), rec.ownerLun()));
         uint16_t length = sizeof reading;
-        const uint8_t code =
-            IpmiIfc::sendCmd(node, cmd::getSensorReading, netfn::sensorEvent, 1, &number, &length, reading);
-        // Only the address goes back; channel and LUN matter only next to an
-        // IPMB address, and every IPMB request sets all three.
-        bmc.targetAddress = savedAddress;
+        const uint8_t code = IpmiIfcCopyAnswer(resp.get(), &length, reading);
 
         reading_valid = code == cc::ok;
         if (code == cc::requestedSensorNotPresent) {
