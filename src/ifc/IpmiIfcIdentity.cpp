@@ -357,7 +357,7 @@ bool set_bmc_prop(const char* value, unsigned int length, unsigned char paramete
         const unsigned int room = static_cast<unsigned int>(kSetBlockBytes - offset);
         const unsigned int chunk = length - sent < room ? length - sent : room;
         memcpy(block + offset, value + sent, chunk);
-        g_IpmiNode[0].msgCounter++;  // every block uses up two message ids
+        IpmiIfcNextMsgId(0);  // every block uses up two message ids
         RespHolder resp(IpmiIfcSendCmd(0, cmd::setSystemInfoParameters, netfn::app, 0, sizeof block, block, 0));
         if (!resp) {
             ipmiLog(LOG_DEBUG, "%s: No response to prop=%d, val='%s'", "set_bmc_prop", parameter, text.c_str());

@@ -60,6 +60,11 @@ int IpmiIfcRespReuse(ipmiifc_resp* r);
 int IpmiIfcRespDel(ipmiifc_resp** r);
 ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiifc_resp* reuse);
 ipmiifc_resp* IpmiIfcSend(int node, ipmiifc_req* req, int flags);
+// Takes the node's next message id. Ids need not be unique, but requests are
+// stamped from several threads, so the counter moves atomically.
+inline uint32_t IpmiIfcNextMsgId(int node) {
+    return __atomic_fetch_add(&g_IpmiNode[node].msgCounter, 1u, __ATOMIC_RELAXED);
+}
 // Sends a Sensor/Event command carrying the sensor number alone to the
 // sensor's owner (IPMB address, channel, LUN) instead of node 0's current
 // target. The switch and the request happen under the senders' lock, so no

@@ -281,8 +281,7 @@ ipmiifc_req stampedRequest(uint8_t cmd, uint8_t netfn, uint16_t data_len, uint8_
     req.cmd = cmd;
     req.data_len = data_len;
     req.data = data;
-    // Not locked: message ids need not be unique, one request is outstanding at a time.
-    req.msgid = g_IpmiNode[0].msgCounter++;
+    req.msgid = IpmiIfcNextMsgId(0);
     return req;
 }
 }  // namespace
@@ -303,7 +302,7 @@ ipmiifc_resp* IpmiIfcSendToOwner(int node, uint8_t command, uint8_t sensorNumber
     req.data = &sensorNumber;
     IpmiNode& bmc = g_IpmiNode[0];
     TAV::MutexLock senders(bmc.devInfoMutex);
-    req.msgid = g_IpmiNode[node].msgCounter++;
+    req.msgid = IpmiIfcNextMsgId(node);
     const uint32_t savedAddress = bmc.targetAddress;
     bmc.targetAddress = owner;
     bmc.targetChannel = channel;

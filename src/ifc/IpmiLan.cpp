@@ -52,7 +52,7 @@ const char* const kInstantiate = "IpmiIfcLanInstantiate";
 int IpmiLan::findLanChannel() {
     for (int number = kFirstChannel; number <= kLastChannel; ++number) {
         uint8_t request = static_cast<uint8_t>(number);
-        g_IpmiNode[0].msgCounter++;  // one id here, one more in IpmiIfcSendCmd
+        IpmiIfcNextMsgId(0);  // one id here, one more in IpmiIfcSendCmd
         RespHolder r(IpmiIfcSendCmd(0, cmd::getChannelInfo, netfn::app, 0, 1, &request, 0));
         if (!r) {
             ipmiLog(LOG_DEBUG, "%s: Get Channel %d Info - NULL response", "initChannelNumber", number);
