@@ -1,6 +1,6 @@
-// Sensor discovery: which records become sensors of which class, what the
-// controller is asked while they are built, what callers get from getSensors,
-// and callers reading the list while the repository is read again.
+// Sensor discovery and the per-poll reading refresh: which records become
+// sensors of which class, what the controller is asked and when it stops being
+// asked, what callers get, and callers reading while the repository is read again.
 
 #include <gtest/gtest.h>
 
@@ -15,78 +15,21 @@
 namespace {
 
 using namespace Ipmi;
+using Sim::Fault;
+using TestSupport::SdrBuilder;
 using Bytes = std::vector<uint8_t>;
 using SensorList = std::vector<std::shared_ptr<IpmiSensor>>;
 
 constexpr uint8_t se = netfn::sensorEvent;
-constexpr uint8_t kThresholdType = sdr::eventReadingTypeThreshold;
+constexpr uint8_t kFull = sdr::type::fullSensor, kCompact = sdr::type::compactSensor, kEventOnly = sdr::type::eventOnly;
+constexpr uint8_t kThreshold = sdr::eventReadingTypeThreshold;
 constexpr uint8_t kSensorSpecific = 0x6F;
 constexpr uint8_t kMemory = 0x0C;
-constexpr uint8_t kEntitySystemBoard = 0x07;
-constexpr uint8_t kEntityBios = 0x22;
+constexpr uint8_t kBios = 0x22;
 
-// What a test says about one sensor; the rest of its record is zero.
-struct Spec {
-    uint8_t number = 1;
-    uint8_t eventReadingType = kThresholdType;
-    uint8_t sensorType = 0x01;
-    uint8_t owner = 0x20;
-    uint8_t channel = 0;
-    uint8_t lun = 0;
-    uint8_t entity = kEntitySystemBoard;
-    uint16_t assertionMask = 0;
-    uint16_t deassertionMask = 0;
-    uint8_t capabilities = 0;
-    std::string name = "Sensor";
-};
-
-Bytes record(uint16_t id, uint8_t type, size_t idStringAt, const Spec& s) {
-    Bytes r(idStringAt + s.name.size(), 0);
-    r[sdr::header::recordId] = static_cast<uint8_t>(id & 0xFF);
-    r[sdr::header::recordId + 1] = static_cast<uint8_t>(id >> 8);
-    r[sdr::header::version] = 0x51;
-    r[sdr::header::recordType] = type;
-    r[sdr::header::remainingLength] = static_cast<uint8_t>(r.size() - sdr::header::length);
-    r[sdr::key::ownerId] = s.owner;
-    r[sdr::key::ownerLun] = static_cast<uint8_t>(s.channel << 4 | s.lun);
-    r[sdr::key::sensorNumber] = s.number;
-    r[sdr::key::entityId] = s.entity;
-    r[sdr::key::entityInstance] = 1;
-    r[idStringAt - 1] = static_cast<uint8_t>(0xC0 | s.name.size());
-    std::copy(s.name.begin(), s.name.end(), r.begin() + static_cast<long>(idStringAt));
-    return r;
-}
-
-void putMasks(Bytes& r, const Spec& s) {
-    r[sdr::sensor::capabilities] = s.capabilities;
-    r[sdr::sensor::sensorType] = s.sensorType;
-    r[sdr::sensor::eventReadingType] = s.eventReadingType;
-    r[sdr::sensor::assertionMask] = static_cast<uint8_t>(s.assertionMask & 0xFF);
-    r[sdr::sensor::assertionMask + 1] = static_cast<uint8_t>(s.assertionMask >> 8);
-    r[sdr::sensor::deassertionMask] = static_cast<uint8_t>(s.deassertionMask & 0xFF);
-    r[sdr::sensor::deassertionMask + 1] = static_cast<uint8_t>(s.deassertionMask >> 8);
-}
-
-Bytes fullRecord(uint16_t id, const Spec& s) {
-    Bytes r = record(id, sdr::type::fullSensor, sdr::full::idString, s);
-    putMasks(r, s);
-    r[sdr::sensor::readableThresholds] = sdr::bits::allThresholds;
-    r[sdr::full::mLow] = 1;
-    return r;
-}
-
-Bytes compactRecord(uint16_t id, const Spec& s) {
-    Bytes r = record(id, sdr::type::compactSensor, sdr::compact::idString, s);
-    putMasks(r, s);
-    return r;
-}
-
-Bytes eventOnlyRecord(uint16_t id, const Spec& s, uint8_t instanceModifierByte = 0) {
-    Bytes r = record(id, sdr::type::eventOnly, sdr::eventOnly::idString, s);
-    r[sdr::eventOnly::sensorType] = s.sensorType;
-    r[sdr::eventOnly::eventReadingType] = s.eventReadingType;
-    r[sdr::eventOnly::instanceModifier] = instanceModifierByte;
-    return r;
+// A record of sensor `number`, whose record ID is the number too.
+SdrBuilder record(uint8_t recordType, uint8_t number, uint8_t eventReadingType = kThreshold, uint8_t sensorType = 1) {
+    return SdrBuilder::of(recordType, number).set(sdr::key::sensorNumber, number).types(sensorType, eventReadingType).id("S");
 }
 
 class SensorDiscovery : public TestSupport::SimTest {
@@ -94,23 +37,24 @@ protected:
     void TearDown() override {
         IpmiIfcSdrCleanUpAll(0);
         IpmiIfcSdrCleanUpHeaders(0);
-        IpmiIfcEntityCleanUpAll(0);  // the tree the refresh chain built
+        IpmiIfcEntityCleanUpAll(0);      // the tree the refresh chain built
         IpmiIfcSensorInstantiateAll(0);  // no records left: empties the list
         SimTest::TearDown();
     }
 
-    // A record, and the sensor behind it on its controller.
-    Sim::SensorModel& add(const Bytes& r, const Spec& s) {
+    // Files the record and gives the controller the sensor behind it.
+    Sim::SensorModel& add(const Bytes& r) {
         bmc().sdr.records.push_back(r);
+        const sdr::SdrView v(r.data(), r.size());
         Sim::SensorModel m;
-        m.owner = s.owner;
-        m.channel = s.channel;
-        m.lun = s.lun;
-        m.number = s.number;
-        m.type = s.sensorType;
-        m.eventReadingType = s.eventReadingType;
+        m.owner = v.byteAt(sdr::key::ownerId);
+        m.channel = v.byteAt(sdr::key::ownerLun) >> 4;
+        m.lun = v.byteAt(sdr::key::ownerLun) & 0x03;
+        m.number = v.byteAt(sdr::key::sensorNumber);
+        m.eventOnly = v.isEventOnly();
+        m.type = v.byteAt(m.eventOnly ? sdr::eventOnly::sensorType : sdr::sensor::sensorType);
+        m.eventReadingType = v.byteAt(m.eventOnly ? sdr::eventOnly::eventReadingType : sdr::sensor::eventReadingType);
         m.readableMask = sdr::bits::allThresholds;
-        m.eventOnly = r[sdr::header::recordType] == sdr::type::eventOnly;
         bmc().sensors.push_back(m);
         return bmc().sensors.back();
     }
@@ -118,6 +62,12 @@ protected:
     SensorList discover() {
         EXPECT_EQ(IpmiIfcSdrGetInfo(0), 0u);
         return IpmiIfc::getSensors();
+    }
+    // Discovery; what the refresh asks and logs is counted from here.
+    void discoverThenCount() {
+        discover();
+        sim().resetCounters();
+        log.clear();
     }
 
     // Requests of one Sensor/Event command for one sensor number.
@@ -127,162 +77,95 @@ protected:
             if (r.netfn == se && r.cmd == command && !r.data.empty() && r.data[0] == number) ++n;
         return n;
     }
+    unsigned readsOf(uint8_t number) const { return asked(cmd::getSensorReading, number); }
+    // Readings, thresholds and hysteresis asked of one sensor.
+    std::vector<unsigned> asks(uint8_t number) const {
+        return {readsOf(number), asked(cmd::getSensorThresholds, number), asked(cmd::getSensorHysteresis, number)};
+    }
 
     static std::shared_ptr<IpmiSensor> numbered(const SensorList& list, uint8_t number) {
         for (const auto& s : list)
             if (s->getSensorNumber() == number) return s;
         return nullptr;
     }
+    static std::vector<int> numbers(const SensorList& list) {
+        std::vector<int> out;
+        for (const auto& s : list) out.push_back(s->getSensorNumber());
+        return out;
+    }
+    static std::string skipping(uint8_t number) {
+        return "Skipping reading update for previous failed sensor 0x" + std::to_string(number);  // numbers below 10
+    }
 };
 
+using SensorRefresh = SensorDiscovery;
+
+// Full sensors come first although the compact records lead the repository;
+// each group lists its records newest first.
 TEST_F(SensorDiscovery, EventReadingTypeChoosesTheClassOrDropsTheRecord) {
-    const struct {
-        uint8_t number;
-        uint8_t eventReadingType;
-        bool kept;
-        bool discrete;
-    } cases[] = {
-        {1, 0x01, true, false},  {2, 0x02, true, true},   {3, 0x0C, true, true},  {4, 0x6F, true, true},
-        {5, 0x70, true, true},   {6, 0x75, true, true},   {7, 0x7F, true, true},  {8, 0x00, false, false},
-        {9, 0x0D, false, false}, {10, 0x6E, false, false}, {11, 0x80, false, false},
-    };
-    uint16_t id = 1;
-    for (const auto& c : cases) {
-        Spec s;
-        s.number = c.number;
-        s.eventReadingType = c.eventReadingType;
-        add(fullRecord(id++, s), s);
-    }
+    add(record(kCompact, 12, 0x6E));
+    add(record(kCompact, 13, kSensorSpecific));
+    const uint8_t types[] = {0x01, 0x02, 0x0C, 0x6F, 0x70, 0x75, 0x7F, 0x00, 0x0D, 0x6E, 0x80};
+    for (uint8_t n = 1; n <= 11; ++n) add(record(kFull, n, types[n - 1]));
+    Bytes cut = record(kFull, 14, kSensorSpecific);  // ends before its event/reading type
+    cut.resize(sdr::sensor::eventReadingType);
+    cut[sdr::header::remainingLength] = static_cast<uint8_t>(cut.size() - sdr::header::length);
+    add(cut);
+
     const SensorList sensors = discover();
 
-    for (const auto& c : cases) {
-        SCOPED_TRACE(int(c.eventReadingType));
-        const auto sensor = numbered(sensors, c.number);
-        ASSERT_EQ(sensor != nullptr, c.kept);
-        if (c.kept) {
-            EXPECT_EQ(sensor->isDiscrete(), c.discrete);
-        }
-    }
-    EXPECT_EQ(sensors.size(), 7u);
+    EXPECT_EQ(numbers(sensors), (std::vector<int>{7, 6, 5, 4, 3, 2, 1, 13}));
+    for (const auto& s : sensors) EXPECT_EQ(s->isDiscrete(), s->getSensorNumber() != 1) << s->getSensorNumber();
     EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, full event_type 0 (ID: 8, Type 1)\n"));
     EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, full event_type 6e (ID: a, Type 1)\n"));
     EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, full event_type 80 (ID: b, Type 1)\n"));
-}
-
-TEST_F(SensorDiscovery, CompactRecordsAreDroppedWithTheirOwnMessage) {
-    Spec s;
-    s.number = 3;
-    s.eventReadingType = 0x6E;
-    add(compactRecord(1, s), s);
-    s.number = 4;
-    s.eventReadingType = kSensorSpecific;
-    add(compactRecord(2, s), s);
-
-    const SensorList sensors = discover();
-
-    ASSERT_EQ(sensors.size(), 1u);
-    EXPECT_EQ(sensors[0]->getSensorNumber(), 4);
+    EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, full event_type 0 (ID: e, Type 1)\n"));
     EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, compact event_type 110, full event_type 110\n"));
 }
 
-// Full records first, then compact ones, each list newest record first.
-TEST_F(SensorDiscovery, ListHoldsFullThenCompactSensorsInListOrder) {
-    Spec s;
-    for (uint8_t n : {1, 2}) {
-        s.number = n;
-        add(compactRecord(n, s), s);
-    }
-    for (uint8_t n : {3, 4}) {
-        s.number = n;
-        add(fullRecord(n, s), s);
-    }
-    std::vector<int> order;
-    for (const auto& sensor : discover()) order.push_back(sensor->getSensorNumber());
-    EXPECT_EQ(order, (std::vector<int>{4, 3, 2, 1}));
-}
-
 TEST_F(SensorDiscovery, DiscreteSensorsOfEntityZeroAndBiosAreHiddenThresholdOnesAreNot) {
-    Spec s;
-    s.entity = kEntityBios;
-    s.number = 1;
-    add(fullRecord(1, s), s);  // threshold
-    s.number = 2;
-    s.eventReadingType = kSensorSpecific;
-    add(fullRecord(2, s), s);
-    s.number = 3;
-    s.entity = 0x00;
-    add(compactRecord(3, s), s);
-    s.number = 4;
-    s.entity = kEntitySystemBoard;
-    add(compactRecord(4, s), s);
-    s.number = 5;
-    s.entity = kEntityBios;
-    add(eventOnlyRecord(5, s), s);
-
-    const SensorList sensors = discover();
-
-    std::vector<int> numbers;
-    for (const auto& sensor : sensors) numbers.push_back(sensor->getSensorNumber());
-    EXPECT_EQ(numbers, (std::vector<int>{1, 4}));
+    add(record(kFull, 1).set(sdr::key::entityId, kBios));
+    add(record(kFull, 2, kSensorSpecific).set(sdr::key::entityId, kBios));
+    add(record(kCompact, 3, kSensorSpecific).set(sdr::key::entityId, 0x00));
+    add(record(kCompact, 4, kSensorSpecific));
+    add(record(kEventOnly, 5, kSensorSpecific).set(sdr::key::entityId, kBios));
+    EXPECT_EQ(numbers(discover()), (std::vector<int>{1, 4}));
 }
 
-TEST_F(SensorDiscovery, EachSensorIsReadOnceAndThresholdSensorsAskForThresholdsAndHysteresis) {
-    Spec threshold;
-    threshold.number = 0x10;
-    threshold.capabilities = 0x28;  // hysteresis settable, thresholds readable
-    Sim::SensorModel& t = add(fullRecord(1, threshold), threshold);
-    t.reading = 77;
+TEST_F(SensorDiscovery, EachSensorIsReadOnceAndWhatWasReadIsKept) {
+    Sim::SensorModel& t = add(record(kFull, 0x10).set(sdr::sensor::capabilities, 0x28));  // hysteresis settable
     t.states = sdr::bits::upperNonCritical;
     t.hysteresisPositive = 2;
     t.hysteresisNegative = 3;
-    Spec discrete;
-    discrete.number = 0x20;
-    discrete.eventReadingType = kSensorSpecific;
-    discrete.sensorType = 0x07;
-    add(compactRecord(2, discrete), discrete).states = 0x0180;
+    add(record(kFull, 0x11));  // its record claims no hysteresis
+    add(record(kCompact, 0x20, kSensorSpecific, 0x07)).states = 0x0180;
 
     const SensorList sensors = discover();
 
-    EXPECT_EQ(asked(cmd::getSensorReading, 0x10), 1u);
-    EXPECT_EQ(asked(cmd::getSensorThresholds, 0x10), 1u);
-    EXPECT_EQ(asked(cmd::getSensorHysteresis, 0x10), 1u);
-    EXPECT_EQ(asked(cmd::getSensorReading, 0x20), 1u);
-    EXPECT_EQ(asked(cmd::getSensorThresholds, 0x20), 0u);
-    EXPECT_EQ(asked(cmd::getSensorHysteresis, 0x20), 0u);
-
-    // What was read is kept: state, time and hysteresis answer without asking again.
+    EXPECT_EQ(asks(0x10), (std::vector<unsigned>{1, 1, 1}));
+    EXPECT_EQ(asks(0x11), (std::vector<unsigned>{1, 1, 0}));
+    EXPECT_EQ(asks(0x20), (std::vector<unsigned>{1, 0, 0}));
+    // State, reading time and hysteresis answer without asking again.
     const unsigned before = sim().totalExchanges();
-    auto thresholdSensor = std::dynamic_pointer_cast<IpmiThresholdSensor>(numbered(sensors, 0x10));
-    ASSERT_NE(thresholdSensor, nullptr);
-    EXPECT_EQ(thresholdSensor->getState(false), sdr::bits::upperNonCritical);
-    EXPECT_TRUE(thresholdSensor->hasReadingTime());
+    auto threshold = std::dynamic_pointer_cast<IpmiThresholdSensor>(numbered(sensors, 0x10));
+    ASSERT_NE(threshold, nullptr);
+    EXPECT_EQ(threshold->getState(false), sdr::bits::upperNonCritical);
+    EXPECT_TRUE(threshold->hasReadingTime());
     unsigned char positive = 0, negative = 0;
-    EXPECT_EQ(thresholdSensor->getHysteresis(positive, negative, false), 0);
+    EXPECT_EQ(threshold->getHysteresis(positive, negative, false), 0);
     EXPECT_EQ(positive, 2);
     EXPECT_EQ(negative, 3);
     EXPECT_EQ(numbered(sensors, 0x20)->getState(false), 0x0180u);
     EXPECT_EQ(sim().totalExchanges(), before);
-}
 
-TEST_F(SensorDiscovery, ThresholdSensorWithoutHysteresisSupportIsNotAskedForIt) {
-    Spec s;
-    s.number = 0x10;
-    add(fullRecord(1, s), s);
+    sim().addFault(se, cmd::getSensorHysteresis, Fault::completionCode(cc::nodeBusy));
     discover();
-    EXPECT_EQ(asked(cmd::getSensorThresholds, 0x10), 1u);
-    EXPECT_EQ(asked(cmd::getSensorHysteresis, 0x10), 0u);
+    EXPECT_TRUE(log.contains(LOG_ERR, "IpmiIfcSensorGetThresholds: getHysteresis(0, 0, true) returned cc = 192"));
 }
 
 TEST_F(SensorDiscovery, RequestsGoToTheOwnerAndOnlyTheAddressIsPutBack) {
-    Spec s;
-    s.number = 0x42;
-    s.owner = 0x2C;
-    s.channel = 6;
-    s.lun = 1;
-    add(fullRecord(1, s), s);
-    node().targetAddress = 0;
-    node().targetChannel = 0;
-    node().targetLun = 0;
+    add(record(kFull, 0x42).set(sdr::key::ownerId, 0x2C).set(sdr::key::ownerLun, 0x61));  // channel 6, LUN 1
+    node().targetAddress = node().targetChannel = node().targetLun = 0;
 
     discover();
 
@@ -290,10 +173,7 @@ TEST_F(SensorDiscovery, RequestsGoToTheOwnerAndOnlyTheAddressIsPutBack) {
     for (const auto& r : sim().requests()) {
         if (r.netfn != se) continue;
         ++seen;
-        EXPECT_TRUE(r.viaIpmb);
-        EXPECT_EQ(r.address, 0x2C);
-        EXPECT_EQ(r.channel, 6);
-        EXPECT_EQ(r.lun, 1);
+        EXPECT_TRUE(r.viaIpmb && r.address == 0x2C && r.channel == 6 && r.lun == 1) << int(r.cmd);
         EXPECT_EQ(r.data, Bytes{0x42});
     }
     EXPECT_EQ(seen, 2u);  // thresholds, reading
@@ -302,196 +182,80 @@ TEST_F(SensorDiscovery, RequestsGoToTheOwnerAndOnlyTheAddressIsPutBack) {
     EXPECT_EQ(node().targetLun, 1);
 }
 
-TEST_F(SensorDiscovery, SoftwareOwnedSensorIsKeptButNeverAsked) {
-    Spec s;
-    s.number = 0x30;
-    s.owner = 0x41;  // bit 0: a software ID
-    add(fullRecord(1, s), s);
-
-    const SensorList sensors = discover();
-
-    ASSERT_EQ(sensors.size(), 1u);
-    EXPECT_EQ(sim().exchanges(se, cmd::getSensorReading), 0u);
-    EXPECT_EQ(sim().exchanges(se, cmd::getSensorThresholds), 0u);
-    EXPECT_EQ(sensors[0]->getLastPollResult(), 0xFFFFFFFFu);
-    EXPECT_FALSE(sensors[0]->hasReadingTime());
-}
-
 TEST_F(SensorDiscovery, EventOnlyRecordsBecomeSensorsWithoutBeingRead) {
-    Spec s;
-    s.number = 1;  // threshold
-    add(eventOnlyRecord(1, s), s);
-    s.number = 2;
-    s.eventReadingType = kSensorSpecific;
-    add(eventOnlyRecord(2, s), s);
-    s.number = 3;
-    s.eventReadingType = 0x05;
-    add(eventOnlyRecord(3, s), s);
+    add(record(kEventOnly, 1));
+    add(record(kEventOnly, 2, kSensorSpecific));
+    add(record(kEventOnly, 3, 0x05));
     // The OEM range is looked for in byte 13, not in the event/reading type.
-    s.number = 4;
-    s.eventReadingType = 0x75;
-    add(eventOnlyRecord(4, s, 0x00), s);
-    s.number = 5;
-    s.eventReadingType = 0x40;
-    add(eventOnlyRecord(5, s, 0x72), s);
-    s.number = 6;
-    s.eventReadingType = 0x00;
-    add(eventOnlyRecord(6, s), s);
-
-    const SensorList sensors = discover();
+    add(record(kEventOnly, 4, 0x75));
+    add(record(kEventOnly, 5, 0x40).set(sdr::eventOnly::instanceModifier, 0x72));
+    add(record(kEventOnly, 6, 0x00));
 
     std::vector<std::pair<int, bool>> seen;
-    for (const auto& sensor : sensors) seen.emplace_back(sensor->getSensorNumber(), sensor->isDiscrete());
+    for (const auto& s : discover()) seen.emplace_back(s->getSensorNumber(), s->isDiscrete());
+
     EXPECT_EQ(seen, (std::vector<std::pair<int, bool>>{{5, true}, {3, true}, {2, true}, {1, false}}));
     EXPECT_EQ(sim().exchanges(se, cmd::getSensorReading), 0u);
-    EXPECT_EQ(asked(cmd::getSensorThresholds, 1), 1u);
     EXPECT_EQ(sim().exchanges(se, cmd::getSensorThresholds), 1u);
-    EXPECT_FALSE(log.contains(LOG_WARNING, "IpmiIfcSensorGetThresholds: Sensor Number = 0x1, failed send cc = 0xcb"));
+    EXPECT_EQ(asked(cmd::getSensorThresholds, 1), 1u);
 }
 
 TEST_F(SensorDiscovery, MemoryEventsFlagFollowsMemorySensorsWithEvents) {
-    Spec quiet;
-    quiet.number = 1;
-    quiet.sensorType = kMemory;
-    quiet.eventReadingType = kSensorSpecific;
-    add(fullRecord(1, quiet), quiet);
+    add(record(kFull, 1, kSensorSpecific, kMemory));
     discover();
     EXPECT_FALSE(IpmiIfc::generatesMemoryEvents(0));
 
-    Spec deasserting = quiet;
-    deasserting.number = 2;
-    deasserting.deassertionMask = 0x0001;
-    add(compactRecord(2, deasserting), deasserting);
+    add(record(kCompact, 2, kSensorSpecific, kMemory).word(sdr::sensor::deassertionMask, 0x0001));
     discover();
     EXPECT_TRUE(IpmiIfc::generatesMemoryEvents(0));
 
-    // Each discovery starts from a cleared flag.
-    bmc().sdr.records.pop_back();
+    bmc().sdr.records.pop_back();  // each discovery starts from a cleared flag
     discover();
     EXPECT_FALSE(IpmiIfc::generatesMemoryEvents(0));
 
-    // An event-only memory record needs no mask.
-    Spec eventOnly = quiet;
-    eventOnly.number = 3;
-    add(eventOnlyRecord(3, eventOnly), eventOnly);
+    add(record(kEventOnly, 3, kSensorSpecific, kMemory));  // needs no mask
     discover();
     EXPECT_TRUE(IpmiIfc::generatesMemoryEvents(0));
 }
 
 TEST_F(SensorDiscovery, FailedRequestsAreLoggedExceptAbsentAndIllegalSensors) {
-    Spec s;
-    s.number = 0x15;
-    add(fullRecord(1, s), s);
-    sim().addFault(se, cmd::getSensorThresholds, Sim::Fault::completionCode(cc::nodeBusy));
-    sim().addFault(se, cmd::getSensorReading, Sim::Fault::completionCode(cc::nodeBusy));
-    SensorList sensors = discover();
+    add(record(kFull, 0x15));
+    for (uint8_t code : {cc::nodeBusy, cc::invalidCommand, cc::requestedSensorNotPresent, cc::illegalForSensorType}) {
+        sim().addFault(se, cmd::getSensorThresholds, Fault::completionCode(code));
+        sim().addFault(se, cmd::getSensorReading, Fault::completionCode(code));
+        EXPECT_EQ(discover().at(0)->getLastPollResult(), code);
+    }
+    // 0xCB and 0xCD are never reported; 0xC1 only for the reading.
     EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcSensorGetThresholds: Sensor Number = 0x15, failed send cc = 0xc0"));
     EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcSensorGetReading: Sensor Number 0x15, failed send cc = 0xc0"));
-    ASSERT_EQ(sensors.size(), 1u);
-    EXPECT_EQ(sensors[0]->getLastPollResult(), cc::nodeBusy);
-
-    for (uint8_t code : {cc::invalidCommand, cc::requestedSensorNotPresent, cc::illegalForSensorType}) {
-        log.clear();
-        sim().addFault(se, cmd::getSensorThresholds, Sim::Fault::completionCode(code));
-        sim().addFault(se, cmd::getSensorReading, Sim::Fault::completionCode(code));
-        sensors = discover();
-        size_t sensorLines = 0;
-        for (const auto& line : log.lines())
-            if (line.text.find("Sensor Number") != std::string::npos) ++sensorLines;
-        EXPECT_EQ(sensorLines, code == cc::invalidCommand ? 1u : 0u) << log.dump();
-    }
+    EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcSensorGetReading: Sensor Number 0x15, failed send cc = 0xc1"));
+    EXPECT_EQ(log.countAtPriority(LOG_WARNING), 3u) << log.dump();
 }
 
-TEST_F(SensorDiscovery, HysteresisThatCannotBeReadIsReported) {
-    Spec s;
-    s.number = 0x16;
-    s.capabilities = 0x10;  // hysteresis readable
-    add(fullRecord(1, s), s).hysteresisSupport = 0;
-    discover();
-    EXPECT_TRUE(log.contains(LOG_ERR, "IpmiIfcSensorGetThresholds: getHysteresis(0, 0, true) returned cc = 1"));
-
-    log.clear();
-    sim().addFault(se, cmd::getSensorHysteresis, Sim::Fault::completionCode(cc::nodeBusy));
-    discover();
-    EXPECT_TRUE(log.contains(LOG_ERR, "IpmiIfcSensorGetThresholds: getHysteresis(0, 0, true) returned cc = 192"));
-}
-
-TEST_F(SensorDiscovery, RecordsPointBackAtTheSensorsCallersGet) {
-    Spec s;
-    s.number = 1;
-    add(fullRecord(1, s), s);
-    s.number = 2;
-    s.eventReadingType = kSensorSpecific;
-    s.entity = kEntityBios;
-    add(fullRecord(2, s), s);
-
-    const SensorList sensors = discover();
-
-    ASSERT_EQ(sensors.size(), 1u);
-    for (ipmiifc_sdr_list* e = node().work.sdr.lists[SDR_GROUP_FULL]; e != nullptr; e = e->next) {
-        if (e->data[sdr::key::sensorNumber] == 1) {
-            EXPECT_EQ(e->sensor, sensors[0].get());
-        } else {
-            EXPECT_EQ(e->sensor, nullptr);  // hidden: nothing keeps it alive
-        }
-    }
-}
-
+// getSensor is kept answering empty: callers find sensors through getSensors.
 TEST_F(SensorDiscovery, RediscoveryReplacesTheListCallersKeepTheirCopies) {
-    Spec s;
-    s.number = 1;
-    add(fullRecord(1, s), s);
+    add(record(kFull, 1));
     const SensorList first = discover();
-    s.number = 2;
-    add(fullRecord(2, s), s);
+    add(record(kFull, 2));
 
     const SensorList second = discover();
 
     ASSERT_EQ(first.size(), 1u);
     ASSERT_EQ(second.size(), 2u);
     EXPECT_EQ(first[0].use_count(), 1);  // the list let go of it
-    EXPECT_EQ(first[0]->getSensorNumber(), 1);
     EXPECT_NE(numbered(second, 1), first[0]);
-}
-
-TEST_F(SensorDiscovery, GetSensorAnswersEmptyEvenForAKnownSensor) {
-    Spec s;
-    s.number = 7;
-    add(fullRecord(1, s), s);
-    ASSERT_EQ(discover().size(), 1u);
-    EXPECT_EQ(IpmiIfc::getSensor(0x20, 7), nullptr);
-    EXPECT_EQ(IpmiIfc::getSensor(0, 0x20, 7), nullptr);
-    EXPECT_EQ(IpmiIfc::getSensor(0x20, 8), nullptr);
-}
-
-TEST_F(SensorDiscovery, NodesOutsideTheTableHaveNoSensors) {
+    EXPECT_EQ(IpmiIfc::getSensor(0x20, 1), nullptr);
+    EXPECT_EQ(IpmiIfc::getSensor(0, 0x20, 1), nullptr);
     EXPECT_TRUE(IpmiIfc::getSensors(-1).empty());
     EXPECT_TRUE(IpmiIfc::getSensors(IPMI_NODE_COUNT).empty());
-    EXPECT_EQ(IpmiIfc::getSensor(IPMI_NODE_COUNT, 0x20, 1), nullptr);
-}
-
-TEST_F(SensorDiscovery, RecordsCutShortAreReadOnlyAsFarAsTheyGo) {
-    // A full record that ends inside its masks: its event/reading type reads as absent.
-    Spec s;
-    s.number = 9;
-    Bytes cut = fullRecord(1, s);
-    cut.resize(sdr::sensor::eventReadingType);
-    cut[sdr::header::remainingLength] = static_cast<uint8_t>(cut.size() - sdr::header::length);
-    add(cut, s);
-    EXPECT_TRUE(discover().empty());
-    EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, full event_type 0 (ID: 1, Type 1)\n"));
 }
 
 // Callers copy the list, walk the entities and read their sensors' records
 // while the repository is read and the sensors rebuilt again and again.
 TEST_F(SensorDiscovery, CallersReadWhileTheRepositoryIsReadAgain) {
-    Spec s;
-    for (uint8_t n = 1; n <= 6; ++n) {
-        s.number = n;
-        s.eventReadingType = n % 2 ? kThresholdType : kSensorSpecific;
-        s.entity = static_cast<uint8_t>(kEntitySystemBoard + n % 3);
-        add(n % 3 ? fullRecord(n, s) : compactRecord(n, s), s);
-    }
+    for (uint8_t n = 1; n <= 6; ++n)
+        add(record(n % 3 ? kFull : kCompact, n, n % 2 ? kThreshold : kSensorSpecific)
+                .set(sdr::key::entityId, static_cast<uint8_t>(0x07 + n % 3)));
     discover();
 
     std::atomic<bool> done{false};
@@ -516,9 +280,124 @@ TEST_F(SensorDiscovery, CallersReadWhileTheRepositoryIsReadAgain) {
     a.join();
     b.join();
 
-    EXPECT_GT(looks.load(), 0u);
     EXPECT_EQ(IpmiIfc::getSensors().size(), 6u);
     EXPECT_FALSE(IpmiIfc::getEntities().empty());
+}
+
+TEST_F(SensorRefresh, ReadsFullAndCompactSensorsAndRefreshesThresholdsOfThresholdSensors) {
+    add(record(kFull, 1));
+    add(record(kCompact, 2, kSensorSpecific));
+    add(record(kCompact, 3));
+    add(record(kEventOnly, 4));
+    add(record(kEventOnly, 5, kSensorSpecific));
+    discoverThenCount();
+    const auto threshold = numbered(IpmiIfc::getSensors(), 1);
+    const auto discrete = numbered(IpmiIfc::getSensors(), 2);
+    bmc().sensors[0].states = sdr::bits::lowerCritical;
+    bmc().sensors[1].states = 0x0104;
+
+    EXPECT_EQ(IpmiIfcSensorUpdateReading(0), 0);
+
+    const std::vector<unsigned> expected[] = {{1, 1, 0}, {1, 0, 0}, {1, 1, 0}, {0, 1, 0}, {0, 0, 0}};
+    for (uint8_t n = 1; n <= 5; ++n) EXPECT_EQ(asks(n), expected[n - 1]) << int(n);
+    EXPECT_EQ(sim().totalExchanges(), 6u);
+    // The new readings reach the objects callers already hold.
+    EXPECT_EQ(threshold->getState(false), sdr::bits::lowerCritical);
+    EXPECT_EQ(discrete->getState(false), 0x0104u);
+
+    IpmiIfcSdrCleanUpAll(0);  // what stop does to the records: the sensors still refresh safely
+    EXPECT_EQ(IpmiIfcSensorUpdateReading(0), 0);
+    EXPECT_EQ(readsOf(1), 2u);
+}
+
+TEST_F(SensorRefresh, AbsentOrIllegalSensorIsNeverAskedAgainUntilRediscovery) {
+    for (uint8_t code : {cc::requestedSensorNotPresent, cc::illegalForSensorType}) {
+        SCOPED_TRACE(int(code));
+        bmc().sdr.records.clear();
+        bmc().sensors.clear();
+        add(record(kFull, 1));
+        add(record(kFull, 2));
+        add(record(kFull, 3)).present = false;  // absent already at discovery
+        discoverThenCount();
+
+        sim().addFault(se, cmd::getSensorReading, Fault::completionCode(code));  // the first one read: sensor 2
+        for (int poll = 0; poll < 3; ++poll) IpmiIfcSensorUpdateReading(0);
+
+        EXPECT_EQ(readsOf(3), 0u);
+        EXPECT_EQ(readsOf(2), 1u);
+        EXPECT_EQ(readsOf(1), 3u);
+        EXPECT_EQ(log.count(skipping(3)), 3u);
+        EXPECT_EQ(log.count(skipping(2)), 2u);
+        EXPECT_EQ(asked(cmd::getSensorThresholds, 2), 1u);  // only with the failed read
+
+        // A new discovery builds new objects: they start without a past.
+        discoverThenCount();
+        IpmiIfcSensorUpdateReading(0);
+        EXPECT_EQ(readsOf(2), 1u);
+    }
+}
+
+TEST_F(SensorRefresh, OnlyATimeOutThatRepeatsThreeTimesStopsTheReads) {
+    constexpr uint8_t T = cc::timeout, B = cc::nodeBusy;
+    // The answer to the reading at discovery, then on each poll (0: the reading).
+    const struct { const char* what; std::vector<uint8_t> answers; unsigned reads; size_t skips; } cases[] = {
+        {"time-outs from the first poll on", {0, T, T, T, T, T, T}, 4, 2},
+        {"a time-out at discovery is the first", {T, T, T, T, T, T}, 3, 2},
+        {"an answer between time-outs", {0, T, T, T, 0, T, T, T}, 7, 0},
+        {"other failures", {0, B, B, B, B, B}, 5, 0},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.what);
+        bmc().sdr.records.clear();
+        bmc().sensors.clear();
+        add(record(kFull, 1));
+        for (size_t i = 0; i < c.answers.size(); ++i) {
+            sim().clearFaults();
+            if (c.answers[i] != 0) sim().addFault(se, cmd::getSensorReading, Fault::completionCode(c.answers[i]));
+            if (i == 0) {
+                discoverThenCount();
+            } else {
+                IpmiIfcSensorUpdateReading(0);
+            }
+        }
+        EXPECT_EQ(readsOf(1), c.reads);
+        EXPECT_EQ(log.count(skipping(1)), c.skips);
+    }
+}
+
+// Full sensors are listed newest record first: 3, 2 (software-owned), 1.
+TEST_F(SensorRefresh, SoftwareOwnedSensorIsNeverAskedAndEndsThePassWhereItStands) {
+    add(record(kFull, 1));
+    add(record(kFull, 2).set(sdr::key::ownerId, 0x41));  // bit 0: a software ID
+    add(record(kFull, 3));
+    add(record(kCompact, 4));
+    const SensorList sensors = discover();
+    ASSERT_EQ(sensors.size(), 4u);
+    EXPECT_EQ(asks(2), (std::vector<unsigned>{0, 0, 0}));
+    EXPECT_FALSE(numbered(sensors, 2)->hasReadingTime());
+    sim().resetCounters();
+
+    EXPECT_EQ(IpmiIfcSensorUpdateReading(0), -1);
+
+    EXPECT_EQ(asks(3), (std::vector<unsigned>{1, 1, 0}));
+    EXPECT_EQ(sim().totalExchanges(), 2u);
+    EXPECT_TRUE(log.contains(LOG_DEBUG, "IpmiIfcSensorUpdateReading: failed send to get reading."));
+}
+
+TEST_F(SensorRefresh, UnansweredRequestEndsThePassButIsAskedAgainNextTime) {
+    add(record(kFull, 1));
+    add(record(kFull, 2));
+    discoverThenCount();
+    sim().addFault(se, cmd::getSensorReading, Fault::of(Sim::FaultKind::NoAnswer));
+
+    EXPECT_EQ(IpmiIfcSensorUpdateReading(0), -1);
+    EXPECT_EQ(asks(2), (std::vector<unsigned>{1, 0, 0}));
+    EXPECT_EQ(readsOf(1), 0u);
+
+    sim().resetCounters();
+    EXPECT_EQ(IpmiIfcSensorUpdateReading(0), 0);
+    EXPECT_EQ(readsOf(2), 1u);
+    EXPECT_EQ(readsOf(1), 1u);
 }
 
 }  // namespace

@@ -3,6 +3,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "SdrLayout.h"
+
 namespace TestSupport {
 
 LogCapture::LogCapture() { Ipmi::setLogSink(&LogCapture::sink, this); }
@@ -82,6 +84,65 @@ void SimTest::useBmc(std::shared_ptr<Sim::Bmc> bmc) {
 
 double SimTest::virtualSecondsElapsed() const {
     return static_cast<double>(Sim::Simulator::instance().clock().offsetNs() - clockAtStart_) / 1e9;
+}
+
+SdrBuilder::SdrBuilder(uint8_t recordType, size_t idStringAt, uint16_t recordId)
+    : bytes_(idStringAt, 0), idAt_(idStringAt) {
+    using namespace Ipmi::sdr;
+    word(header::recordId, recordId);
+    set(header::version, 0x51);
+    set(header::recordType, recordType);
+    set(key::ownerId, 0x20);
+    set(key::sensorNumber, 1);
+    set(key::entityId, 0x07);
+    set(key::entityInstance, 1);
+}
+
+SdrBuilder SdrBuilder::of(uint8_t recordType, uint16_t recordId) {
+    using namespace Ipmi::sdr;
+    const size_t idAt = recordType == type::fullSensor      ? full::idString
+                        : recordType == type::compactSensor ? compact::idString
+                        : recordType == type::eventOnly     ? eventOnly::idString
+                                                            : header::length + 12;
+    return SdrBuilder(recordType, idAt, recordId);
+}
+SdrBuilder SdrBuilder::full(uint16_t recordId) { return of(Ipmi::sdr::type::fullSensor, recordId); }
+SdrBuilder SdrBuilder::compact(uint16_t recordId) { return of(Ipmi::sdr::type::compactSensor, recordId); }
+SdrBuilder SdrBuilder::eventOnly(uint16_t recordId) { return of(Ipmi::sdr::type::eventOnly, recordId); }
+
+SdrBuilder& SdrBuilder::set(size_t offset, uint8_t value) {
+    if (offset >= bytes_.size()) bytes_.resize(offset + 1, 0);
+    bytes_[offset] = value;
+    return *this;
+}
+
+SdrBuilder& SdrBuilder::word(size_t offset, uint16_t value) {
+    set(offset, static_cast<uint8_t>(value & 0xFF));
+    return set(offset + 1, static_cast<uint8_t>(value >> 8));
+}
+
+SdrBuilder& SdrBuilder::types(uint8_t sensorType, uint8_t eventReadingType) {
+    using namespace Ipmi::sdr;
+    const bool eventOnlyRecord = bytes_[header::recordType] == type::eventOnly;
+    set(eventOnlyRecord ? eventOnly::sensorType : sensor::sensorType, sensorType);
+    return set(eventOnlyRecord ? eventOnly::eventReadingType : sensor::eventReadingType, eventReadingType);
+}
+
+SdrBuilder& SdrBuilder::id(const std::string& text) {
+    return idCoded(static_cast<uint8_t>(0xC0 | text.size()), text);
+}
+
+SdrBuilder& SdrBuilder::idCoded(uint8_t typeLength, const std::string& text) {
+    bytes_.resize(idAt_);
+    bytes_[idAt_ - 1] = typeLength;
+    bytes_.insert(bytes_.end(), text.begin(), text.end());
+    return *this;
+}
+
+std::vector<uint8_t> SdrBuilder::bytes() const {
+    std::vector<uint8_t> out = bytes_;
+    out[Ipmi::sdr::header::remainingLength] = static_cast<uint8_t>(out.size() - Ipmi::sdr::header::length);
+    return out;
 }
 
 std::string realDataPath(const std::string& relative) {

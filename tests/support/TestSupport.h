@@ -57,6 +57,31 @@ protected:
     int64_t clockAtStart_ = 0;
 };
 
+// A sensor data record built field by field. Full, compact and event-only
+// records start with version 0x51, owner 0x20, sensor number 1 and entity 0x07
+// (system board) instance 1, and an empty ID string; every other byte is 0.
+class SdrBuilder {
+public:
+    SdrBuilder(uint8_t recordType, size_t idStringAt, uint16_t recordId = 1);
+    static SdrBuilder of(uint8_t recordType, uint16_t recordId = 1);  // ID string where the type keeps it
+    static SdrBuilder full(uint16_t recordId = 1);
+    static SdrBuilder compact(uint16_t recordId = 1);
+    static SdrBuilder eventOnly(uint16_t recordId = 1);
+    SdrBuilder& set(size_t offset, uint8_t value);  // grows the record when needed
+    SdrBuilder& word(size_t offset, uint16_t value);  // little-endian
+    // Sensor type and event/reading type where this kind of record keeps them.
+    SdrBuilder& types(uint8_t sensorType, uint8_t eventReadingType);
+    SdrBuilder& id(const std::string& text);  // 8-bit characters
+    SdrBuilder& idCoded(uint8_t typeLength, const std::string& bytes);
+    // The record with its remaining-length byte filled in.
+    std::vector<uint8_t> bytes() const;
+    operator std::vector<uint8_t>() const { return bytes(); }
+
+private:
+    std::vector<uint8_t> bytes_;
+    size_t idAt_;
+};
+
 // Path of a file under ../shared/data/real, or empty (and the test skips) when absent.
 std::string realDataPath(const std::string& relative);
 
