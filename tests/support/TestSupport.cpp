@@ -145,6 +145,28 @@ std::vector<uint8_t> SdrBuilder::bytes() const {
     return out;
 }
 
+LoopThread::LoopThread(int interval)
+    : thread_([interval] {
+          try {
+              Ipmi::IpmiIfc::start(0, interval);
+          } catch (const kelInt::CmpiStatus&) {
+          }
+      }) {}
+
+LoopThread::~LoopThread() {
+    if (!stopped_) stop();
+    thread_.join();
+}
+
+void LoopThread::stop() {
+    stopped_ = true;
+    Ipmi::IpmiIfc::stop();
+}
+
+void waitUntil(const std::function<bool()>& done) {
+    while (!done()) Sim::realSleepNs(1000000);
+}
+
 std::string realDataPath(const std::string& relative) {
     std::string path = std::string(TAV_IPMI_REAL_DATA_DIR) + "/" + relative;
     struct stat st;

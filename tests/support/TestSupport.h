@@ -3,9 +3,11 @@
 
 #include <gtest/gtest.h>
 
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "Bmc.h"
@@ -81,6 +83,23 @@ private:
     std::vector<uint8_t> bytes_;
     size_t idAt_;
 };
+
+// IpmiIfc::start(0, interval) on a thread of its own, as a host process runs
+// it. Destruction stops the interface (unless stop() was called) and joins.
+class LoopThread {
+public:
+    explicit LoopThread(int interval);
+    ~LoopThread();
+    void stop();
+
+private:
+    bool stopped_ = false;
+    std::thread thread_;
+};
+
+// Re-checks `done` every real millisecond until it holds. The wait itself
+// leaves virtual time alone, so what it moves is the library's own waiting.
+void waitUntil(const std::function<bool()>& done);
 
 // Path of a file under ../shared/data/real, or empty (and the test skips) when absent.
 std::string realDataPath(const std::string& relative);
