@@ -4,7 +4,6 @@
 #include <gtest/gtest.h>
 
 #include <functional>
-#include <ctype.h>
 
 #include "CmpiStatus.h"
 #include "IpmiSensor.h"
@@ -16,34 +15,24 @@ namespace {
 using namespace Ipmi;
 using Sim::Fault;
 using Sim::FaultKind;
+using TestSupport::SdrBuilder;
+using Bytes = std::vector<uint8_t>;
 
 constexpr uint8_t kNumber = 0x05;
 constexpr uint8_t se = netfn::sensorEvent;
 
 // Full threshold record of sensor 5 on the BMC: M = 1, B = 0, linear; all
-// thresholds readable, LC and UC settable, hysteresis readable and settable.
-std::vector<uint8_t> thresholdRecord() {
-    std::vector<uint8_t> r(sdr::full::idString, 0);
-    r[sdr::header::recordType] = sdr::type::fullSensor;
-    r[sdr::key::ownerId] = 0x20;
-    r[sdr::key::sensorNumber] = kNumber;
-    r[sdr::sensor::capabilities] = 0x28;  // hysteresis settable, thresholds readable/settable
-    r[sdr::sensor::sensorType] = 0x01;
-    r[sdr::sensor::eventReadingType] = sdr::eventReadingTypeThreshold;
-    r[sdr::sensor::readableThresholds] = 0x3F;
-    r[sdr::sensor::settableThresholds] = sdr::bits::lowerCritical | sdr::bits::upperCritical;
-    r[sdr::full::mLow] = 1;
-    r[sdr::full::upperCritical] = 90;
-    r[sdr::full::lowerCritical] = 10;
-    return r;
-}
-
-std::vector<uint8_t> discreteRecord() {
-    auto r = thresholdRecord();
-    r[sdr::sensor::capabilities] = 0;
-    r[sdr::sensor::sensorType] = 0x07;
-    r[sdr::sensor::eventReadingType] = 0x6F;
-    return r;
+// thresholds readable, LC and UC settable (defaults 10 and 90), hysteresis settable.
+SdrBuilder thresholdRecord() {
+    return SdrBuilder::full()
+        .set(sdr::key::sensorNumber, kNumber)
+        .set(sdr::sensor::capabilities, 0x28)  // hysteresis settable, thresholds readable and settable
+        .types(0x01, sdr::eventReadingTypeThreshold)
+        .set(sdr::sensor::readableThresholds, 0x3F)
+        .set(sdr::sensor::settableThresholds, sdr::bits::lowerCritical | sdr::bits::upperCritical)
+        .set(sdr::full::mLow, 1)
+        .set(sdr::full::upperCritical, 90)
+        .set(sdr::full::lowerCritical, 10);
 }
 
 class SensorTest : public TestSupport::SimTest {
@@ -63,25 +52,21 @@ protected:
         bmc().sensors = {t};
     }
     Sim::SensorModel& model() { return bmc().sensors[0]; }
-    void makeModelDiscrete(uint16_t states) {
-        model().eventReadingType = 0x6F;
-        model().states = states;
-    }
     template <class S>
-    S sensorOf(std::vector<uint8_t> r) {
-        return S(0, r.data(), static_cast<int>(r.size()));
-    }
+    static S sensorOf(Bytes r) { return S(0, r.data(), static_cast<int>(r.size())); }
     IpmiThresholdSensor threshold() { return sensorOf<IpmiThresholdSensor>(thresholdRecord()); }
-    IpmiDiscreteSensor discrete() { return sensorOf<IpmiDiscreteSensor>(discreteRecord()); }
-    std::vector<uint8_t> lastRequestData() { return sim().requests().back().data; }
+    IpmiDiscreteSensor discrete() {
+        return sensorOf<IpmiDiscreteSensor>(thresholdRecord().set(sdr::sensor::capabilities, 0).types(0x07, 0x6F));
+    }
+    Bytes lastRequest() { return sim().requests().back().data; }
+    // The message of the CmpiStatus that `call` throws, as logged.
     std::string failureOf(const std::function<void()>& call) {
         log.clear();
         try {
             call();
         } catch (const kelInt::CmpiStatus& e) {
-            EXPECT_EQ(CMPI_RC_ERR_FAILED, e.rc());
             for (const auto& l : log.lines())
-                if (l.text.rfind("CmpiStatus error 1 ", 0) == 0) return l.text.substr(19);
+                if (e.rc() == CMPI_RC_ERR_FAILED && l.text.rfind("CmpiStatus error 1 ", 0) == 0) return l.text.substr(19);
             return "(no message)";
         }
         return "(no exception)";
@@ -91,61 +76,56 @@ protected:
 TEST_F(SensorTest, ReadingIsAskedOfTheSensorsOwner) {
     auto s = threshold();
     EXPECT_EQ(42u, s.getReading());
-    Sim::Request local = sim().requests().back();
-    EXPECT_EQ(cmd::getSensorReading, local.cmd);
-    EXPECT_FALSE(local.viaIpmb);
-    EXPECT_EQ(std::vector<uint8_t>{kNumber}, local.data);
-    EXPECT_TRUE(s.hasReadingTime());
+    EXPECT_FALSE(sim().requests().back().viaIpmb);
+    EXPECT_EQ(Bytes{kNumber}, lastRequest());
     std::string when;
     s.getReadingTime(when);
-    const std::string shape = "dddd-dd-ddTdd:dd:ddZ";
-    ASSERT_EQ(shape.size(), when.size()) << when;
-    for (size_t i = 0; i < shape.size(); ++i)
-        EXPECT_TRUE(shape[i] == 'd' ? isdigit(static_cast<unsigned char>(when[i])) != 0 : when[i] == shape[i]) << when;
+    EXPECT_TRUE(when.size() == 20 && when[4] == '-' && when[10] == 'T' && when[19] == 'Z') << when;
 
-    // A satellite controller on IPMB channel 6, LUN 1.
-    auto r = thresholdRecord();
-    r[sdr::key::ownerId] = 0x2C;
-    r[sdr::key::ownerLun] = 0x61;
+    // A satellite controller on IPMB channel 6, LUN 1; the target address is put back.
     model().owner = 0x2C;
     model().channel = 6;
     model().lun = 1;
     node().targetAddress = 0x20;
-    EXPECT_EQ(42u, sensorOf<IpmiThresholdSensor>(r).getReading());
-    Sim::Request remote = sim().requests().back();
-    EXPECT_TRUE(remote.viaIpmb);
-    EXPECT_EQ(0x2C, remote.address);
-    EXPECT_EQ(6, remote.channel);
-    EXPECT_EQ(1, remote.lun);
-    EXPECT_EQ(0x20u, node().targetAddress) << "the target address is restored";
+    EXPECT_EQ(42u, sensorOf<IpmiThresholdSensor>(thresholdRecord().set(sdr::key::ownerId, 0x2C).set(sdr::key::ownerLun, 0x61))
+                       .getReading());
+    const Sim::Request remote = sim().requests().back();
+    EXPECT_TRUE(remote.viaIpmb && remote.address == 0x2C && remote.channel == 6 && remote.lun == 1);
+    EXPECT_EQ(0x20u, node().targetAddress);
 
-    // A software-owned sensor is never asked.
-    const unsigned before = sim().totalExchanges();
-    r[sdr::key::ownerId] = 0x41;
-    EXPECT_EQ(0u, sensorOf<IpmiThresholdSensor>(r).getReading());
+    const unsigned before = sim().totalExchanges();  // a software-owned sensor is never asked
+    EXPECT_EQ(0u, sensorOf<IpmiThresholdSensor>(thresholdRecord().set(sdr::key::ownerId, 0x41)).getReading());
     EXPECT_EQ(before, sim().totalExchanges());
     EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiSensor::getSDReading no value read for sensor 5"));
 }
 
-TEST_F(SensorTest, ThresholdHealthFollowsTheCrossedThresholds) {
-    auto s = threshold();
+TEST_F(SensorTest, StatesFollowTheReading) {
+    auto t = threshold();
     int state = -1;
-    for (const auto& c : std::vector<std::pair<uint16_t, int>>{{0x08, 10}, {0x01, 10}, {0x02, 25}, {0x20, 25}, {0x00, 5}}) {
+    for (const auto& c : std::vector<std::pair<uint16_t, int>>{{0x08, 10}, {0x01, 10}, {0x02, 25}, {0x20, 25}, {0, 5}}) {
         model().states = c.first;
-        EXPECT_TRUE(s.getSensorState(state));
+        EXPECT_TRUE(t.getSensorState(state));
         EXPECT_EQ(c.second, state) << "states 0x" << std::hex << c.first;
     }
     model().states = 0x10;
-    EXPECT_EQ(0x10u, s.getState(true));
-}
+    EXPECT_EQ(0x10u, t.getState(true));
 
-TEST_F(SensorTest, AnAbsentSensorIsNotAnError) {
-    model().present = false;
-    auto s = threshold();
-    int state = -1;
-    EXPECT_FALSE(s.getSensorState(state));
+    model().eventReadingType = 0x6F;  // discrete readings carry fifteen state bits
+    model().states = 0x7F81;
+    auto d = discrete();
+    EXPECT_EQ(0x7F81u, d.getReading());
+    EXPECT_EQ(0x7F81u, d.getState(true));
+    model().states = 0x0102;  // an answer without byte 4: the previous answer's states do not linger
+    sim().addFault(se, cmd::getSensorReading, Fault::answerLength(FaultKind::CutAnswer, 4));
+    EXPECT_EQ(0x02u, d.getReading());
+    model().states = 0;
+    EXPECT_TRUE(d.getSensorState(state));
+    EXPECT_EQ(5, state) << "no state asserted is OK";
+
+    model().present = false;  // an absent sensor is not an error
+    EXPECT_FALSE(t.getSensorState(state));
     EXPECT_EQ(0, state);
-    EXPECT_EQ(0u, s.getState(true));
+    EXPECT_EQ(0u, t.getState(true));
     EXPECT_EQ(0u, log.count("IpmiSensor::getSDReading no value read for sensor 5"));
 }
 
@@ -159,45 +139,23 @@ TEST_F(SensorTest, AFailedReadingIsLoggedAndThrownByTheStateGetters) {
                              "IpmiSensor::getSDReading: unexpected return cc code for node: 0 cmd: 45/4 was 0xc0"));
     EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiSensor::getSDReading no value read for sensor 5"));
     EXPECT_EQ("Threshold Sensor reading not available", failureOf([&] { t.getState(false); }));
-    auto d = discrete();
-    EXPECT_EQ("Discrete Sensor reading not available", failureOf([&] { d.getState(true); }));
-}
-
-TEST_F(SensorTest, DiscreteReadingsCarryFifteenStateBits) {
-    makeModelDiscrete(0x7F81);
-    auto d = discrete();
-    EXPECT_EQ(0x7F81u, d.getReading());
-    EXPECT_EQ(0x7F81u, d.getState(true));
-    int state = -1;
-    model().states = 0;
-    EXPECT_TRUE(d.getSensorState(state));
-    EXPECT_EQ(5, state) << "no state asserted is OK";
-
-    // An answer without byte 4: the states of the previous answer do not linger.
-    model().states = 0x0102;
-    sim().addFault(se, cmd::getSensorReading, Fault::answerLength(FaultKind::CutAnswer, 4));
-    EXPECT_EQ(0x02u, d.getReading());
+    EXPECT_EQ("Discrete Sensor reading not available", failureOf([&] { discrete().getState(true); }));
 }
 
 TEST_F(SensorTest, ThresholdGettersAskTheControllerAndConvert) {
     auto s = threshold();
     EXPECT_DOUBLE_EQ(90.0, s.getUpperCriticalThreshold(true));
     EXPECT_EQ(cmd::getSensorThresholds, sim().requests().back().cmd);
-    EXPECT_EQ(std::vector<uint8_t>{kNumber}, lastRequestData());
+    EXPECT_EQ(Bytes{kNumber}, lastRequest());
     EXPECT_DOUBLE_EQ(10.0, s.getLowerCriticalThreshold());
     EXPECT_DOUBLE_EQ(0.0, s.getLowerNonCriticalThreshold()) << "readable in the SDR but not by the controller";
-
-    // Bytes the controller did not send read as 0, not as the last answer's.
     sim().addFault(se, cmd::getSensorThresholds, Fault::answerLength(FaultKind::CutAnswer, 4));
-    EXPECT_DOUBLE_EQ(0.0, s.getUpperCriticalThreshold());
-
+    EXPECT_DOUBLE_EQ(0.0, s.getUpperCriticalThreshold()) << "bytes not sent read as 0, not as the last answer's";
     sim().addFault(se, cmd::getSensorThresholds, Fault::completionCode(cc::illegalForSensorType));
     EXPECT_EQ("Failed to get threshold reading", failureOf([&] { s.getUpperCriticalThreshold(); }));
     EXPECT_TRUE(log.contains(LOG_DEBUG, "invalid command to sensor(0x5), cc = 0xcd"));
 
-    auto r = thresholdRecord();
-    r[sdr::sensor::readableThresholds] = sdr::bits::upperCritical;
-    auto partly = sensorOf<IpmiThresholdSensor>(r);
+    auto partly = sensorOf<IpmiThresholdSensor>(thresholdRecord().set(sdr::sensor::readableThresholds, sdr::bits::upperCritical));
     const unsigned before = sim().totalExchanges();
     EXPECT_EQ("Threshold sensor does not support lower non-critical", failureOf([&] { partly.getLowerNonCriticalThreshold(); }));
     EXPECT_EQ("Threshold sensor does not support upper non-recoverable",
@@ -210,80 +168,67 @@ TEST_F(SensorTest, SetThresholdsSendsOnlySettableNonZeroValues) {
     auto s = threshold();
     EXPECT_EQ(0, s.setThresholds(1.0, 12.0, 3.0, 0.0, 95.0, 0.0));
     EXPECT_EQ(cmd::setSensorThresholds, sim().requests().back().cmd);
-    EXPECT_EQ((std::vector<uint8_t>{kNumber, 0x12, 0, 12, 0, 0, 95, 0}), lastRequestData());
-    EXPECT_EQ(12, model().thresholds[1]);
+    EXPECT_EQ((Bytes{kNumber, 0x12, 0, 12, 0, 0, 95, 0}), lastRequest());
     EXPECT_EQ(95, model().thresholds[4]);
-
     EXPECT_EQ(0, s.restoreDefaultThresholds());
-    EXPECT_EQ((std::vector<uint8_t>{kNumber, 0x12, 0, 10, 0, 0, 90, 0}), lastRequestData());
+    EXPECT_EQ((Bytes{kNumber, 0x12, 0, 10, 0, 0, 90, 0}), lastRequest());
 
     model().settableMask = sdr::bits::upperCritical;  // the controller disagrees with the SDR
     EXPECT_EQ(cc::invalidDataField, s.setThresholds(0.0, 11.0, 0.0, 0.0, 0.0, 0.0));
     sim().addFault(se, cmd::setSensorThresholds, Fault::completionCode(cc::invalidCommand));
     EXPECT_EQ(1, s.setThresholds(0.0, 0.0, 0.0, 0.0, 91.0, 0.0));
-
     const unsigned before = sim().totalExchanges();
     EXPECT_EQ(1, discrete().setThresholds(1.0, 1.0, 1.0, 1.0, 1.0, 1.0));
     EXPECT_EQ(1, discrete().restoreDefaultThresholds());
     EXPECT_EQ(before, sim().totalExchanges());
 }
 
-TEST_F(SensorTest, RearmLimitsTheMaskHighBytesByClass) {
+// Event masks in the enable and re-arm commands keep 12 bits for a threshold
+// sensor and 15 for a discrete one; the enable masks are read only while events are on.
+TEST_F(SensorTest, EventEnablesAndRearmLimitTheMasksByClass) {
     auto t = threshold();
     EXPECT_EQ(0, t.rearmEvents());
-    EXPECT_EQ((std::vector<uint8_t>{kNumber, 0x00}), lastRequestData());
+    EXPECT_EQ((Bytes{kNumber, 0x00}), lastRequest());
     EXPECT_EQ(0, t.rearmEvents(0xFFFF, 0xFFFF));
-    EXPECT_EQ((std::vector<uint8_t>{kNumber, 0x80, 0xFF, 0x0F, 0xFF, 0x0F}), lastRequestData());
-    EXPECT_EQ(0x0FFF, model().rearmedAssert);
-
-    makeModelDiscrete(0);
-    EXPECT_EQ(0, discrete().rearmEvents(0xFFFF, 0xFFFF));
-    EXPECT_EQ((std::vector<uint8_t>{kNumber, 0x80, 0xFF, 0x7F, 0xFF, 0x7F}), lastRequestData());
-    sim().addFault(se, cmd::rearmSensorEvents, Fault::completionCode(cc::illegalForSensorType));
-    EXPECT_EQ(1, discrete().rearmEvents());
-}
-
-TEST_F(SensorTest, EventEnableMasksAreReadOnlyWhileEventsAreOn) {
-    auto t = threshold();
+    EXPECT_EQ((Bytes{kNumber, 0x80, 0xFF, 0x0F, 0xFF, 0x0F}), lastRequest());
     EXPECT_EQ(0, t.setEventEnable(0x90, 0xF234, 0x0FFF));  // enable selected
-    EXPECT_EQ((std::vector<uint8_t>{kNumber, 0x90, 0x34, 0x02, 0xFF, 0x0F}), lastRequestData());
+    EXPECT_EQ((Bytes{kNumber, 0x90, 0x34, 0x02, 0xFF, 0x0F}), lastRequest());
     unsigned char flags = 0;
     unsigned short assertMask = 0xAAAA, deassertMask = 0xBBBB;
     EXPECT_EQ(0, t.getEventEnable(flags, assertMask, deassertMask));
     EXPECT_EQ(0x80, flags);
     EXPECT_EQ(0x0234, assertMask);
     EXPECT_EQ(0x0FFF, deassertMask);
-
     model().eventFlags = 0x40;  // scanning only
-    assertMask = 0xAAAA;
-    deassertMask = 0xBBBB;
-    EXPECT_EQ(0, t.getEventEnable(flags, assertMask, deassertMask));
+    EXPECT_EQ(0, t.getEventEnable(flags, assertMask = 0xAAAA, deassertMask = 0xBBBB));
     EXPECT_EQ(0x40, flags);
     EXPECT_EQ(0xAAAA, assertMask);
     EXPECT_EQ(0xBBBB, deassertMask);
-
     sim().addFault(se, cmd::getSensorEventEnable, Fault::completionCode(cc::invalidCommand));
     EXPECT_EQ(1, t.getEventEnable(flags, assertMask, deassertMask));
     sim().addFault(se, cmd::setSensorEventEnable, Fault::completionCode(cc::nodeBusy));
     EXPECT_EQ(cc::nodeBusy, t.setEventEnable(0x80, 0, 0));
+
+    model().eventReadingType = 0x6F;
+    EXPECT_EQ(0, discrete().rearmEvents(0xFFFF, 0xFFFF));
+    EXPECT_EQ((Bytes{kNumber, 0x80, 0xFF, 0x7F, 0xFF, 0x7F}), lastRequest());
+    sim().addFault(se, cmd::rearmSensorEvents, Fault::completionCode(cc::illegalForSensorType));
+    EXPECT_EQ(1, discrete().rearmEvents());
 }
 
 TEST_F(SensorTest, HysteresisIsCachedUntilAskedAfresh) {
     auto t = threshold();
     unsigned char positive = 9, negative = 9;
     EXPECT_EQ(0, t.getHysteresis(positive, negative, false));
-    EXPECT_EQ(0, positive);
-    EXPECT_EQ(0, negative);
+    EXPECT_EQ(std::make_pair(0, 0), std::make_pair(int(positive), int(negative))) << "never fetched";
     EXPECT_EQ(0u, sim().totalExchanges());
 
     t.cacheHysteresis();
-    EXPECT_EQ((std::vector<uint8_t>{kNumber, 0xFF}), lastRequestData());
+    EXPECT_EQ((Bytes{kNumber, 0xFF}), lastRequest());
     EXPECT_EQ(0, t.getHysteresis(positive, negative, false));
-    EXPECT_EQ(2, positive);
-    EXPECT_EQ(3, negative);
-
+    EXPECT_EQ(std::make_pair(2, 3), std::make_pair(int(positive), int(negative)));
     EXPECT_EQ(0, t.setHysteresis(4, 5));
-    EXPECT_EQ((std::vector<uint8_t>{kNumber, 0xFF, 4, 5}), lastRequestData());
+    EXPECT_EQ((Bytes{kNumber, 0xFF, 4, 5}), lastRequest());
     EXPECT_EQ(0, t.getHysteresis(positive, negative, false));
     EXPECT_EQ(2, positive) << "setting does not touch the cache";
     EXPECT_EQ(0, t.getHysteresis(positive, negative, true));
