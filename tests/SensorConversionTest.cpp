@@ -1,10 +1,8 @@
 // Sensor records and value conversion: what a caller reads from a sensor
 // object built from one SDR, without talking to a controller.
 
-#include <dirent.h>
 #include <gtest/gtest.h>
 #include <math.h>
-#include <string.h>
 
 #include <map>
 
@@ -195,19 +193,16 @@ TEST(SensorRecord, DumpPrintsTheRecordSixteenBytesALine) {
 // Every record of every real repository, whatever its type and wherever it is
 // cut, answers every record question without reading outside its bytes.
 TEST(SensorRecord, RealRecordsOfEveryTypeAreReadSafely) {
-    const std::string dir = TestSupport::realDataPath("sdr");
-    SKIP_WITHOUT_REAL_DATA(dir);
+    SKIP_WITHOUT_REAL_DATA(TestSupport::realDataPath("sdr"));
     LogCapture quiet;
     size_t records = 0;
-    DIR* d = opendir(dir.c_str());
-    while (dirent* entry = d != nullptr ? readdir(d) : nullptr) {
-        const size_t n = strlen(entry->d_name);
-        if (n < 4 || strcmp(entry->d_name + n - 4, ".sdr") != 0) continue;
+    for (const auto& file : TestSupport::realDataFiles("sdr", ".sdr")) {
         Sim::Bmc repository;
-        Sim::loadSdrDump(repository, dir + "/" + entry->d_name);
-        for (Bytes& r : repository.sdr.records) {
+        Sim::loadSdrDump(repository, file);
+        for (const Bytes& r : repository.sdr.records) {
             for (size_t cut : {r.size(), r.size() / 2, size_t{3}}) {
-                IpmiDiscreteSensor s(0, r.data(), static_cast<int>(cut));
+                Bytes part(r.begin(), r.begin() + static_cast<long>(cut));  // so that a read past it shows
+                IpmiDiscreteSensor s(0, part.data(), static_cast<int>(cut));
                 unsigned sum = s.getOwnerId() + s.getLun() + s.getChannel() + s.getSensorType() +
                                s.getEventReadingType() + s.getRateUnit() + s.getBaseUnit() + s.getModifierUnit() +
                                s.getModifierUnitUse() + s.getSensorDirection() + s.getHysteresisSupport() +
@@ -220,7 +215,6 @@ TEST(SensorRecord, RealRecordsOfEveryTypeAreReadSafely) {
             ++records;
         }
     }
-    if (d != nullptr) closedir(d);
     EXPECT_GT(records, 2000u);
 }
 

@@ -1,7 +1,10 @@
 #include "TestSupport.h"
 
+#include <dirent.h>
 #include <sys/stat.h>
 #include <unistd.h>
+
+#include <algorithm>
 
 #include "SdrLayout.h"
 
@@ -172,6 +175,20 @@ std::string realDataPath(const std::string& relative) {
     struct stat st;
     if (stat(path.c_str(), &st) != 0) return std::string();
     return path;
+}
+
+std::vector<std::string> realDataFiles(const std::string& dir, const std::string& suffix) {
+    std::vector<std::string> files;
+    const std::string path = realDataPath(dir);
+    DIR* d = path.empty() ? nullptr : opendir(path.c_str());
+    while (dirent* e = d != nullptr ? readdir(d) : nullptr) {
+        const std::string name = e->d_name;
+        if (name.size() > suffix.size() && name.compare(name.size() - suffix.size(), suffix.size(), suffix) == 0)
+            files.push_back(path + "/" + name);
+    }
+    if (d != nullptr) closedir(d);
+    std::sort(files.begin(), files.end());
+    return files;
 }
 
 }  // namespace TestSupport

@@ -103,6 +103,8 @@ void waitUntil(const std::function<bool()>& done);
 
 // Path of a file under ../shared/data/real, or empty (and the test skips) when absent.
 std::string realDataPath(const std::string& relative);
+// Paths of the files in that directory whose names end in `suffix`, sorted; none when absent.
+std::vector<std::string> realDataFiles(const std::string& dir, const std::string& suffix);
 
 #define SKIP_WITHOUT_REAL_DATA(path)                                       \
     do {                                                                   \
