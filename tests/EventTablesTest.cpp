@@ -50,10 +50,12 @@ TEST(EventTables, EveryOneOfThe352KeysHashesToItsOwnRowAndNoOtherKeyFindsText) {
     auto expected = [&](uint32_t key) { return texts.count(key) ? texts[key] : std::string(); };
     for (unsigned type = 0; type < 256; ++type) {
         for (unsigned data1 = 0; data1 < 256; ++data1) {
-            ASSERT_EQ(find_generic_desc(type, data1), expected(selKey(SEL_KEY_GENERIC, type, data1, SEL_KEY_ANY_DATA3)));
-            for (unsigned data3 : {0x00u, 0x01u, 0x19u, 0x1Au, 0xFFu})
-                ASSERT_EQ(find_specific_desc(type, data1, data3), expected(selKey(SEL_KEY_SPECIFIC, type, data1, data3)))
-                    << std::hex << type << "/" << data1 << "/" << data3;
+            const uint32_t generic = selKey(SEL_KEY_GENERIC, type, data1, SEL_KEY_ANY_DATA3);
+            ASSERT_EQ(find_generic_desc(type, data1), expected(generic)) << std::hex << generic;
+            for (unsigned data3 : {0x00u, 0x01u, 0x19u, 0x1Au, 0xFFu}) {
+                const uint32_t specific = selKey(SEL_KEY_SPECIFIC, type, data1, data3);
+                ASSERT_EQ(find_specific_desc(type, data1, data3), expected(specific)) << std::hex << specific;
+            }
         }
     }
 }
@@ -91,7 +93,8 @@ TEST(SelDescription, JoinsDirectionSensorTypeNameAndEventText) {
     LogCapture log;
     const struct { Event_log record; const char* line; const char* message; } cases[] = {
         {eventRecord(0x01, 0x01, 0x09), "Assert + Temperature Upper Critical going high", "Upper Critical going high"},
-        {eventRecord(0x01, 0x81, 0x02), "Deassert + Temperature Lower Critical going low ", "Lower Critical going low "},
+        {eventRecord(0x01, 0x81, 0x02), "Deassert + Temperature Lower Critical going low ",
+         "Lower Critical going low "},
         {eventRecord(0x07, 0x6F, 0x01), "Assert + Processor Thermal Trip", "Thermal Trip"},
         {eventRecord(0x08, 0x6F, 0x06, 0x02), "Assert + Power Supply Config Error: Processor Missing",
          "Config Error: Processor Missing"},
@@ -127,7 +130,8 @@ TEST(SelDescription, OldRevisionsAreNotDescribedOtherRecordTypesAreLoggedAndDesc
 }
 
 TEST(SelDescription, CutsTheLineToTheBufferWithoutWritingPastIt) {
-    const std::string full = "Deassert + System ACPI Power State S1: sleeping with system hw & processor context maintained";
+    const std::string full =
+        "Deassert + System ACPI Power State S1: sleeping with system hw & processor context maintained";
     Event_log r = eventRecord(0x22, 0xEF, 0x01);
     build_sel_desc(r, nullptr, 0);
     for (int size = 0; size <= int(full.size()) + 2; ++size) {

@@ -29,7 +29,8 @@ constexpr uint8_t kBios = 0x22;
 
 // A record of sensor `number`, whose record ID is the number too.
 SdrBuilder record(uint8_t recordType, uint8_t number, uint8_t eventReadingType = kThreshold, uint8_t sensorType = 1) {
-    return SdrBuilder::of(recordType, number).set(sdr::key::sensorNumber, number).types(sensorType, eventReadingType).id("S");
+    return SdrBuilder::of(recordType, number).set(sdr::key::sensorNumber, number).types(sensorType, eventReadingType)
+        .id("S");
 }
 
 class SensorDiscovery : public TestSupport::SimTest {
@@ -52,7 +53,6 @@ protected:
         m.lun = v.byteAt(sdr::key::ownerLun) & 0x03;
         m.number = v.byteAt(sdr::key::sensorNumber);
         m.eventOnly = v.isEventOnly();
-        m.type = v.byteAt(m.eventOnly ? sdr::eventOnly::sensorType : sdr::sensor::sensorType);
         m.eventReadingType = v.byteAt(m.eventOnly ? sdr::eventOnly::eventReadingType : sdr::sensor::eventReadingType);
         m.readableMask = sdr::bits::allThresholds;
         bmc().sensors.push_back(m);
@@ -200,24 +200,6 @@ TEST_F(SensorDiscovery, EventOnlyRecordsBecomeSensorsWithoutBeingRead) {
     EXPECT_EQ(asked(cmd::getSensorThresholds, 1), 1u);
 }
 
-TEST_F(SensorDiscovery, MemoryEventsFlagFollowsMemorySensorsWithEvents) {
-    add(record(kFull, 1, kSensorSpecific, kMemory));
-    discover();
-    EXPECT_FALSE(IpmiIfc::generatesMemoryEvents(0));
-
-    add(record(kCompact, 2, kSensorSpecific, kMemory).word(sdr::sensor::deassertionMask, 0x0001));
-    discover();
-    EXPECT_TRUE(IpmiIfc::generatesMemoryEvents(0));
-
-    bmc().sdr.records.pop_back();  // each discovery starts from a cleared flag
-    discover();
-    EXPECT_FALSE(IpmiIfc::generatesMemoryEvents(0));
-
-    add(record(kEventOnly, 3, kSensorSpecific, kMemory));  // needs no mask
-    discover();
-    EXPECT_TRUE(IpmiIfc::generatesMemoryEvents(0));
-}
-
 TEST_F(SensorDiscovery, FailedRequestsAreLoggedExceptAbsentAndIllegalSensors) {
     add(record(kFull, 0x15));
     for (uint8_t code : {cc::nodeBusy, cc::invalidCommand, cc::requestedSensorNotPresent, cc::illegalForSensorType}) {
@@ -232,21 +214,29 @@ TEST_F(SensorDiscovery, FailedRequestsAreLoggedExceptAbsentAndIllegalSensors) {
     EXPECT_EQ(log.countAtPriority(LOG_WARNING), 3u) << log.dump();
 }
 
-// getSensor is kept answering empty: callers find sensors through getSensors.
-TEST_F(SensorDiscovery, RediscoveryReplacesTheListCallersKeepTheirCopies) {
-    add(record(kFull, 1));
+// Each discovery builds a new list and clears the memory-events flag first;
+// callers keep the sensors they hold. getSensor is kept answering empty.
+TEST_F(SensorDiscovery, RediscoveryStartsAfreshAndCallersKeepTheirCopies) {
+    add(record(kFull, 1, kSensorSpecific, kMemory));
     const SensorList first = discover();
-    add(record(kFull, 2));
+    EXPECT_FALSE(IpmiIfc::generatesMemoryEvents(0));
 
+    add(record(kCompact, 2, kSensorSpecific, kMemory).word(sdr::sensor::deassertionMask, 0x0001));
     const SensorList second = discover();
-
-    ASSERT_EQ(first.size(), 1u);
+    EXPECT_TRUE(IpmiIfc::generatesMemoryEvents(0));
     ASSERT_EQ(second.size(), 2u);
-    EXPECT_EQ(first[0].use_count(), 1);  // the list let go of it
+    EXPECT_EQ(first.at(0).use_count(), 1);  // the list let go of it
     EXPECT_NE(numbered(second, 1), first[0]);
+
+    bmc().sdr.records.pop_back();
+    discover();
+    EXPECT_FALSE(IpmiIfc::generatesMemoryEvents(0));
+    add(record(kEventOnly, 3, kSensorSpecific, kMemory));  // needs no mask
+    discover();
+    EXPECT_TRUE(IpmiIfc::generatesMemoryEvents(0));
+
     EXPECT_EQ(IpmiIfc::getSensor(0x20, 1), nullptr);
     EXPECT_EQ(IpmiIfc::getSensor(0, 0x20, 1), nullptr);
-    EXPECT_TRUE(IpmiIfc::getSensors(-1).empty());
     EXPECT_TRUE(IpmiIfc::getSensors(IPMI_NODE_COUNT).empty());
 }
 
