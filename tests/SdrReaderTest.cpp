@@ -275,11 +275,12 @@ TEST_F(SdrReader, RefusedOrMisshapenInfoAndReservationChangeNothing) {
 }
 
 // A 40-byte record is read from its end in chunks of 16. Each case: what the
-// controller does, and every Get SDR that follows.
+// controller does, and every Get SDR that follows, as reservation:record@offset+count.
 TEST_F(SdrReader, RecordIsReadFromItsEndAndRefusedChunksAreRetried) {
     const Bytes record = sdrRecord(5, 0x01, 40);
     setRepository({record});
     ASSERT_EQ(IpmiIfcSdrReserve(0), 0u);
+    bool cancelled = false;
     const struct {
         const char* what;
         std::function<void()> controller;
@@ -299,6 +300,17 @@ TEST_F(SdrReader, RecordIsReadFromItsEndAndRefusedChunksAreRetried) {
         {"at most 12 bytes", [&] { bmc().sdr.maxReadBytes = 12; }, "a:5@24+16 a:5@24+16 a:5@24+16 a:5@24+16"},
         {"no answer", [&] { sim().addFault(st, cmd::getSdr, Fault::of(FaultKind::NoAnswer, 4)); },
          "a:5@24+16 a:5@24+16 a:5@24+16 a:5@24+16"},
+        // Another client reserves before the second chunk: a new reservation, the same chunk
+        // again. Last, since the hook stays.
+        {"reservation cancelled",
+         [&] {
+             hookGetSdr([&cancelled](Sim::Bmc& b, const Sim::Request& r, const Plain& plain) {
+                 if (r.data[4] == 8 && !cancelled) ++b.sdr.reservation;
+                 cancelled = cancelled || r.data[4] == 8;
+                 return plain();
+             });
+         },
+         "a:5@24+16 a:5@8+16 b:5@8+16 b:5@0+8"},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(c.what);
@@ -315,28 +327,6 @@ TEST_F(SdrReader, RecordIsReadFromItsEndAndRefusedChunksAreRetried) {
     Bytes buffer(1);
     EXPECT_EQ(IpmiIfcSdrReadRecordId(0, 5, buffer.data(), 0), kFailed);  // nothing to read, nothing asked
     EXPECT_EQ(log.count("IpmiIfcSdrReadRecordId: retry expired."), 3u);
-}
-
-TEST_F(SdrReader, ReservationCancelledMidRecordReReservesAndRepeatsTheChunk) {
-    const Bytes record = sdrRecord(5, 0x01, 40);
-    setRepository({record});
-    ASSERT_EQ(IpmiIfcSdrReserve(0), 0u);
-    bool cancelled = false;
-    hookGetSdr([&cancelled](Sim::Bmc& b, const Sim::Request& r, const Plain& plain) {
-        if (r.data[4] == 8 && !cancelled) {
-            cancelled = true;
-            ++b.sdr.reservation;  // another client reserved the repository
-        }
-        return plain();
-    });
-
-    Bytes buffer(40);
-    ASSERT_EQ(IpmiIfcSdrReadRecordId(0, 5, buffer.data(), 40), 0u);
-
-    EXPECT_EQ(buffer, record);
-    EXPECT_EQ(getSdrs(), "a:5@24+16 a:5@8+16 b:5@8+16 b:5@0+8");
-    EXPECT_EQ(sim().exchanges(st, cmd::reserveSdrRepository), 2u);
-    EXPECT_EQ(readerLines(), 0u) << log.dump();
 }
 
 // Refused three times per chunk: the chunks shrink to one byte and no further,
