@@ -40,13 +40,12 @@ TEST_F(Lifecycle, NonRootCallerIsRefused) {
         }
         if (rc != CMPI_RC_ERR_ACCESS_DENIED) _exit(11);
         if (IpmiIfc::getState() != IpmiIfc::IPMI_STATE_STOPPED) _exit(12);
-        if (!log.contains(LOG_ERR, "CmpiStatus error 2 Only root user allowed")) _exit(13);
-        _exit(sim().totalExchanges() == 0 ? 0 : 14);
+        _exit(sim().totalExchanges() == 0 ? 0 : 13);
     }
     int status = 0;
     ASSERT_EQ(waitpid(child, &status, 0), child);
     ASSERT_TRUE(WIFEXITED(status));
-    EXPECT_EQ(WEXITSTATUS(status), 0) << "10 setuid, 11 rc, 12 state, 13 log, 14 device used";
+    EXPECT_EQ(WEXITSTATUS(status), 0) << "10 setuid, 11 rc, 12 state, 13 device used";
 }
 
 TEST_F(Lifecycle, MissingDeviceStopsWithoutLoop) {
@@ -69,9 +68,8 @@ TEST_F(Lifecycle, StartRunsTheLoopUntilStop) {
         EXPECT_NE(fcntl(node().signalCmdPipeFds[FD_WRITE], F_GETFL) & O_NONBLOCK, 0);
         ASSERT_EQ(IpmiIfc::registerSelEventHandler([](void*, IpmiSelData*) {}, nullptr), 0);
 
-        loop.stop();  // returns once the loop has ended
-        EXPECT_TRUE(log.contains(LOG_DEBUG, "Poll loop ended, shutting down"));
-        EXPECT_EQ(IpmiIfc::getState(), IpmiIfc::IPMI_STATE_STOPPED);
+        loop.stop();
+        EXPECT_EQ(IpmiIfc::getState(), IpmiIfc::IPMI_STATE_STOPPED);  // the loop has ended
     }
     EXPECT_EQ(node().fd, -1);
     EXPECT_EQ(node().signalCmdPipeFds[FD_READ], -1);
@@ -84,7 +82,6 @@ TEST_F(Lifecycle, StartRunsTheLoopUntilStop) {
     } catch (const kelInt::CmpiStatus& s) {
         EXPECT_EQ(s.rc(), CMPI_RC_ERROR);
     }
-    EXPECT_TRUE(log.contains(LOG_ERR, "CmpiStatus error 200 IpmiIfc::stop called twice"));
 }
 
 TEST_F(Lifecycle, StopEndsTheLoopsHungExchange) {

@@ -132,8 +132,6 @@ TEST(SimProfile, SensorsAnswerAsTheProfileSetsThem) {
                         "sensor_add 0x20 0 0x60 0x07 0x6f\n"
                         "sensor_set_bit 0x20 0 0x60 7 1 0\n"
                         "sensor_set_bit_clr_rest 0x20 0 0x60 9 1 0\n"
-                        "sensor_add 0x20 0 5 0x01 0x01\n"
-                        "sensor_set_value 0x20 0 5 40 0\n"
                         // Two's complement thresholds: LC -7, LNC -2, UNC 42, UC 47.
                         "sensor_add 0x20 0 1 0x01 0x01\n"
                         "sensor_set_threshold 0x20 0 1 settable 011011 0 47 42 0 0xf9 0xfe\n"
@@ -149,7 +147,6 @@ TEST(SimProfile, SensorsAnswerAsTheProfileSetsThem) {
     EXPECT_EQ(ask(*bmc, netfn::sensorEvent, cmd::getSensorEventEnable, {0x0e}),
               (Sim::Response{0x00, 0xc0, 0x81, 0x02, 0x85, 0x02}));
     EXPECT_EQ(reading(*bmc, 0x60), (Sim::Response{0x00, 0x00, 0x00, 0x00, 0x02}));  // bit 7 cleared by bit 9
-    EXPECT_EQ(reading(*bmc, 5), (Sim::Response{0x00, 40, 0x00, 0x00}));  // quiet until events are enabled
     // 22 C is above -2 C (as unsigned bytes it would be below 0xfe); -8 C is at or below both lower ones.
     EXPECT_EQ(reading(*bmc, 1)[3], 0x00);
     EXPECT_EQ(reading(*bmc, 2)[3], 0x03);
@@ -192,8 +189,8 @@ TEST(SimProfile, SyntaxErrorsNameTheFileAndLine) {
 }
 
 // Profiles InfraSIM captured from servers load whole, with the SDR
-// repositories and FRU images converted from them. OpenIPMI's own examples
-// fail where ipmi_sim 2.0 fails too.
+// repositories and FRU images converted from them; OpenIPMI's own examples
+// fail where ipmi_sim 2.0 fails too; an SDR dump stands in for a profile.
 TEST(SimProfile, RealProfilesLoadAsIpmiSimLoadsThem) {
     const std::string dir = TestSupport::realDataPath("sim");
     SKIP_WITHOUT_REAL_DATA(dir);
@@ -224,22 +221,17 @@ TEST(SimProfile, RealProfilesLoadAsIpmiSimLoadsThem) {
              {"openipmi_marvell_marvell.emu", ":63: cannot open include file " + dir + "/marvell_node.emu"},
              {"openipmi_marvell_marvell_node.emu", ":2: undefined name $MCNUM"}})
         EXPECT_EQ(loadError(dir + "/" + c.first), dir + "/" + c.first + c.second);
-}
-
-TEST(SimProfile, AnSdrDumpStandsInForAProfile) {
-    const std::string path = TestSupport::realDataPath("sdr/openipmi_marvell_axp_sdrcomp.sdr");
-    SKIP_WITHOUT_REAL_DATA(path);
-    auto bmc = Sim::loadProfile(path);
-    EXPECT_EQ(repository(*bmc), fileBytes(path));
-    EXPECT_TRUE(bmc->sensors.empty());
+    if (const std::string dump = TestSupport::realDataPath("sdr/openipmi_marvell_axp_sdrcomp.sdr"); !dump.empty()) {
+        auto bmc = Sim::loadProfile(dump);
+        EXPECT_EQ(repository(*bmc), fileBytes(dump));
+        EXPECT_TRUE(bmc->sensors.empty());
+    }
 }
 
 TEST(SimProfile, TheDefaultServerLoads) {
-    auto bmc = Sim::loadProfile(Sim::defaultProfilePath());
+    auto bmc = Sim::loadProfile(Sim::defaultProfilePath());  // other tests skip a profile that does not load
+    EXPECT_FALSE(bmc->sensors.empty());
     EXPECT_EQ(bmc->fru.devices.size(), 2u);
-    // Inlet Temp reads 22 C against lower thresholds below 0 C: no threshold crossed.
-    EXPECT_EQ(reading(*bmc, 0x01), (Sim::Response{0x00, 22, 0xc0, 0x00}));
-    EXPECT_EQ(reading(*bmc, 0x41), Sim::Response{cc::requestedSensorNotPresent});  // empty supply slot
 }
 
 }  // namespace
