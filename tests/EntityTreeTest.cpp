@@ -5,8 +5,6 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <atomic>
-#include <thread>
 #include <utility>
 #include <vector>
 
@@ -39,12 +37,6 @@ Bytes association(uint8_t containerId, uint8_t containerInstance, uint8_t flags,
 Bytes sensorRecord(uint8_t type, uint8_t entityId, uint8_t entityInstance) {
     return TestSupport::SdrBuilder::of(type).set(sdr::key::entityId, entityId).set(sdr::key::entityInstance,
                                                                                   entityInstance);
-}
-
-std::vector<EntityKey> keys(const std::vector<IpmiEntity>& entities) {
-    std::vector<EntityKey> out;
-    for (const auto& e : entities) out.emplace_back(e.id, e.instance);
-    return out;
 }
 
 class EntityTree : public TestSupport::SimTest {
@@ -81,7 +73,11 @@ protected:
         IpmiIfcEntityInstantiateAll(0);
     }
 
-    std::vector<EntityKey> entities() { return keys(IpmiIfc::getEntities()); }
+    static std::vector<EntityKey> entities() {
+        std::vector<EntityKey> out;
+        for (const auto& e : IpmiIfc::getEntities()) out.emplace_back(e.id, e.instance);
+        return out;
+    }
 
     EntityKey parentOf(unsigned id, unsigned instance) {
         IpmiEntity p = IpmiIfc::getEntityParent(id, instance);
@@ -170,37 +166,6 @@ TEST_F(EntityTree, ShortRecordsGiveOnlyWhatTheyHold) {
     build();
     EXPECT_THAT(entities(), ElementsAre(Pair(kSystemChassis, 3), Pair(kSystemChassis, 2), Pair(kFan, 4),
                                         Pair(kFan, 5), Pair(kSystemChassis, 1), Pair(kFan, 1), Pair(kFan, 2)));
-}
-
-// Readers on other threads see either the old or the new list, never a
-// half-built one, while the chain rebuilds it over and over.
-TEST_F(EntityTree, ReadersDuringRebuildsSeeWholeLists) {
-    repository({association(kSystemChassis, 1, kRanges, {kFan, 1, kFan, 8}),
-                association(kSystemBoard, 1, 0, {kProcessor, 1, kProcessor, 2}),
-                sensorRecord(sdr::type::compactSensor, kPowerSupply, 1)});
-    build();
-    const auto expected = entities();
-    ASSERT_EQ(expected.size(), 13u);
-
-    std::atomic<bool> done{false};
-    std::atomic<int> torn{0};
-    auto reader = [&] {
-        while (!done) {
-            const IpmiEntity p = IpmiIfc::getEntityParent(kFan, 5);
-            const bool parentKnown = p == IpmiEntity(kSystemChassis, 1, 0, 0) || p == IpmiEntity();
-            if (keys(IpmiIfc::getEntities()) != expected || !parentKnown) ++torn;
-        }
-    };
-    std::thread a(reader), b(reader);
-    for (int i = 0; i < 300; ++i) {
-        IpmiIfcEntityCleanUpAll(0);
-        build();
-        IpmiIfcEntityDumpAll(0);
-    }
-    done = true;
-    a.join();
-    b.join();
-    EXPECT_EQ(torn.load(), 0);
 }
 
 // Every later accepted repository info runs the chain again over the kept tree;

@@ -272,8 +272,7 @@ TEST_F(HealthMapper, ShippedRulesGiveCommonStatesAMeaningfulHealth) {
 // Every state a captured sensor can report gets a known health state when
 // the shipped rules know its type.
 TEST_F(HealthMapper, ShippedRulesNeverLeaveRealSensorsOfKnownTypesUnknown) {
-    const std::string sdrDir = TestSupport::realDataPath("sdr");
-    SKIP_WITHOUT_REAL_DATA(sdrDir);
+    SKIP_WITHOUT_REAL_DATA(TestSupport::realDataPath("sdr"));
     ASSERT_TRUE(LoadSensorHealthDataFile((std::string(TAV_IPMI_SOURCE_DIR) + "/data/sensor_health").c_str()));
     auto knownType = [](uint8_t sensorClass, uint8_t sensorType) {
         for (const HealthTableEntry& e : healthList)
@@ -281,10 +280,9 @@ TEST_F(HealthMapper, ShippedRulesNeverLeaveRealSensorsOfKnownTypesUnknown) {
         return false;
     };
     size_t checked = 0;
-    for (const auto& file : std::filesystem::directory_iterator(sdrDir)) {
-        if (file.path().extension() != ".sdr") continue;
+    for (const std::string& file : TestSupport::realDataFiles("sdr", ".sdr")) {
         Sim::Bmc bmc;
-        Sim::loadSdrDump(bmc, file.path());
+        Sim::loadSdrDump(bmc, file);
         for (const auto& record : bmc.sdr.records) {
             const sdr::SdrView view(record.data(), record.size());
             const sdr::SensorRecordView sensor(view);
@@ -294,7 +292,7 @@ TEST_F(HealthMapper, ShippedRulesNeverLeaveRealSensorsOfKnownTypesUnknown) {
                 if (!(sensor.readingMask() & bit(offset))) continue;
                 ++checked;
                 EXPECT_NE(health(cls, sensor.sensorType(), bit(offset)), 0)
-                    << file.path().filename() << " sensor " << int(sensor.sensorNumber()) << " class " << int(cls)
+                    << file << " sensor " << int(sensor.sensorNumber()) << " class " << int(cls)
                     << " type " << int(sensor.sensorType()) << " offset " << offset;
             }
         }

@@ -240,38 +240,43 @@ TEST_F(SensorDiscovery, RediscoveryStartsAfreshAndCallersKeepTheirCopies) {
     EXPECT_TRUE(IpmiIfc::getSensors(IPMI_NODE_COUNT).empty());
 }
 
-// Callers copy the list, walk the entities and read their sensors' records
-// while the repository is read and the sensors rebuilt again and again.
+// Callers read sensors, copy the entity list and ask for parents while the
+// repository is read again and again, the tree freed before each read as stop
+// frees it: they see whole lists, and a parent or none while the tree is empty.
 TEST_F(SensorDiscovery, CallersReadWhileTheRepositoryIsReadAgain) {
     for (uint8_t n = 1; n <= 6; ++n)
         add(record(n % 3 ? kFull : kCompact, n, n % 2 ? kThreshold : kSensorSpecific)
                 .set(sdr::key::entityId, static_cast<uint8_t>(0x07 + n % 3)));
+    bmc().sdr.records.push_back({7, 0, 0x51, sdr::type::entityAssociation, 11, 0x17, 1, 0, 0x07, 1, 0, 0, 0, 0, 0, 0});
     discover();
+    const std::vector<IpmiEntity> entities = IpmiIfc::getEntities();
+    ASSERT_EQ(entities.size(), 4u);  // chassis, its board, and the other two sensor entities
 
     std::atomic<bool> done{false};
     std::atomic<unsigned> looks{0};
     auto caller = [&] {
         while (!done.load()) {
             for (const auto& sensor : IpmiIfc::getSensors()) {
-                const IpmiEntity entity = sensor->getEntity();
                 EXPECT_FALSE(sensor->getSensorIdString().empty());
                 (void)sensor->getSensorTypeString();
                 (void)sensor->getLastPollResult();
-                (void)IpmiIfc::getEntityParent(entity.id, entity.instance);
             }
-            (void)IpmiIfc::getEntities();
+            EXPECT_EQ(IpmiIfc::getEntities(), entities);
+            const IpmiEntity parent = IpmiIfc::getEntityParent(0x07, 1);
+            EXPECT_TRUE(parent == IpmiEntity(0x17, 1, 0, 0) || parent == IpmiEntity());
             ++looks;
         }
     };
     std::thread a(caller), b(caller);
     // At least 20 rebuilds, and as many more as it takes the callers to look 50 times.
-    for (int i = 0; (i < 20 || looks.load() < 50) && i < 100000; ++i) EXPECT_EQ(IpmiIfcSdrGetInfo(0), 0u);
+    for (int i = 0; (i < 20 || looks.load() < 50) && i < 100000; ++i) {
+        IpmiIfcEntityCleanUpAll(0);
+        EXPECT_EQ(IpmiIfcSdrGetInfo(0), 0u);
+    }
     done = true;
     a.join();
     b.join();
-
     EXPECT_EQ(IpmiIfc::getSensors().size(), 6u);
-    EXPECT_FALSE(IpmiIfc::getEntities().empty());
 }
 
 TEST_F(SensorRefresh, ReadsFullAndCompactSensorsAndRefreshesThresholdsOfThresholdSensors) {
