@@ -341,8 +341,8 @@ std::string field(const Block& b, const std::string& key) {
 
 std::vector<std::string> allProfiles() {
     std::vector<std::string> all{"default"};
-    for (const auto& f : realFiles("sim", ".emu")) all.push_back(f);
-    for (const auto& f : realFiles("sdr", ".sdr")) all.push_back(f);
+    for (const auto& f : realDataFiles("sim", ".emu")) all.push_back(f);
+    for (const auto& f : realDataFiles("sdr", ".sdr")) all.push_back(f);
     return all;
 }
 

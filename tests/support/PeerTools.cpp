@@ -1,6 +1,5 @@
 #include "PeerTools.h"
 
-#include <dirent.h>
 #include <ftw.h>
 #include <link.h>
 #include <stdlib.h>
@@ -8,7 +7,6 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <fstream>
 #include <sstream>
 
@@ -125,24 +123,9 @@ ToolRun runIpmiSensors(const std::string& profile, const std::vector<std::string
     return run;
 }
 
-std::vector<std::string> realFiles(const std::string& dir, const std::string& suffix) {
-    std::vector<std::string> out;
-    const std::string base = realDataPath(dir);
-    DIR* d = base.empty() ? nullptr : opendir(base.c_str());
-    if (d == nullptr) return out;
-    while (dirent* e = readdir(d)) {
-        const std::string name = e->d_name;
-        if (name.size() > suffix.size() && name.compare(name.size() - suffix.size(), suffix.size(), suffix) == 0)
-            out.push_back(base + "/" + name);
-    }
-    closedir(d);
-    std::sort(out.begin(), out.end());
-    return out;
-}
-
 std::vector<std::string> referenceSets() {
     std::vector<std::string> all;
-    for (const auto& f : realFiles("sdr", ".sdr")) all.push_back(f.substr(0, f.size() - 4));
+    for (const auto& f : realDataFiles("sdr", ".sdr")) all.push_back(f.substr(0, f.size() - 4));
     return all;
 }
 

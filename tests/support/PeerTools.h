@@ -28,9 +28,6 @@ ToolRun runTool(const std::string& profile, const std::string& tool, const std::
 // `ipmi-sensors` on the simulator with a fresh SDR cache of its own.
 ToolRun runIpmiSensors(const std::string& profile, const std::vector<std::string>& extraArgs = {});
 
-// Files under the real data directory `dir` ending in `suffix`, sorted; empty when absent.
-std::vector<std::string> realFiles(const std::string& dir, const std::string& suffix);
-
 // The captured repositories that have reference decodings beside them, as
 // paths without their ".sdr", and the profile that serves each: the captured
 // server's profile when there is one (the references were taken from ipmi_sim
