@@ -60,7 +60,7 @@ TEST(EventTables, EveryOneOfThe352KeysHashesToItsOwnRowAndNoOtherKeyFindsText) {
     }
 }
 
-TEST(EventTables, KeptTexts) {
+TEST(EventTables, TextsAreKeptAsTheyStandAndSomeAreKeyedOnEventDataThree) {
     EXPECT_EQ(std::count_if(std::begin(ipmi_sel_data), std::end(ipmi_sel_data),
                             [](const ipmi_sel_row& row) { return row.desc && std::string(row.desc).back() == ' '; }),
               6);  // the threshold "going low" texts

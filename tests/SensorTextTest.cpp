@@ -44,7 +44,7 @@ TEST_F(SensorText, SensorTypeAndDirectionAreReadWhereEachRecordKindKeepsThem) {
     EXPECT_EQ(sensorOf(kOther).getSensorDirectionString(), "");
 }
 
-TEST_F(SensorText, UnitNames) {
+TEST_F(SensorText, UnitNamesAndInCommandLineModeTheReadingKind) {
     auto units = [](const SdrBuilder& r, uint8_t base, uint8_t modifier) {
         IpmiDiscreteSensor s =
             sensorOf(SdrBuilder(r).set(sdr::sensor::baseUnit, base).set(sdr::sensor::modifierUnit, modifier));
@@ -104,7 +104,7 @@ TEST_F(SensorText, SharedRecordsGetAnInstanceSuffix) {
     EXPECT_EQ(idOf(SdrBuilder(kFull).set(sdr::compact::sharing, 0x04).id("CPU")), "CPU");  // full records do not share
 }
 
-TEST_F(SensorText, NameDescriptionAndDeviceId) {
+TEST_F(SensorText, NameDescriptionAndDeviceIdOfEachRecordKind) {
     auto texts = [](const SdrBuilder& r, int node = 0) {
         IpmiDiscreteSensor s = sensorOf(r, node);
         return s.getName() + "|" + s.getDescription() + "|" + s.getDeviceId();
