@@ -59,9 +59,10 @@ protected:
     int64_t clockAtStart_ = 0;
 };
 
-// A sensor data record built field by field. Full, compact and event-only
-// records start with version 0x51, owner 0x20, sensor number 1 and entity 0x07
-// (system board) instance 1, and an empty ID string; every other byte is 0.
+// A sensor data record built field by field. Every record starts with version
+// 0x51 and the sensor key of owner 0x20, sensor number 1 and entity 0x07 (system
+// board) instance 1, and an empty ID string; every other byte is 0. of() makes
+// records of types other than full, compact and event-only 17 bytes long.
 class SdrBuilder {
 public:
     SdrBuilder(uint8_t recordType, size_t idStringAt, uint16_t recordId = 1);
