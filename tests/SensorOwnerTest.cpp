@@ -25,13 +25,10 @@ TEST_F(SensorOwner, ReadingsOfASatelliteSensorNeverRedirectOtherThreadsRequests)
     model.reading = 0x42;
     bmc().sensors.push_back(model);
 
-    std::vector<uint8_t> record(sdr::full::idString + 1, 0);
-    record[sdr::header::version] = 0x51;
-    record[sdr::header::recordType] = sdr::type::fullSensor;
-    record[sdr::header::remainingLength] = static_cast<uint8_t>(record.size() - sdr::header::length);
-    record[sdr::key::ownerId] = kSatellite;
-    record[sdr::key::sensorNumber] = model.number;
-    record[sdr::sensor::eventReadingType] = sdr::eventReadingTypeThreshold;
+    std::vector<uint8_t> record = TestSupport::SdrBuilder::full()
+                                      .set(sdr::key::ownerId, kSatellite)
+                                      .set(sdr::key::sensorNumber, model.number)
+                                      .types(0x01, sdr::eventReadingTypeThreshold);
     IpmiThresholdSensor sensor(0, record.data(), static_cast<int>(record.size()));
 
     constexpr int kRounds = 200;
