@@ -15,68 +15,47 @@ namespace {
 
 using namespace TestSupport;
 
-TEST(PeerTools, IpmitoolShowsTheDefaultIdentity) {
+// The Get Device ID answer as raw bytes, then as each tool decodes it.
+TEST(PeerTools, BothToolsSeeTheDefaultIdentity) {
     SKIP_WITHOUT_TOOL("ipmitool");
+    SKIP_WITHOUT_TOOL("bmc-info");
     // mc_add 0x20 0x20 no-device-sdrs 0x01 0x02 0x10 0xbf 0x0002a2 0x0100
+    ToolRun raw = runTool("default", toolPath("ipmitool"), {"-I", "open", "raw", "0x06", "0x01"});
+    ASSERT_EQ(raw.exitCode, 0) << raw.err;
+    EXPECT_EQ(trim(raw.out), "20 01 02 10 02 bf a2 02 00 00 01 00 00 00 00");
+
     ToolRun info = runTool("default", toolPath("ipmitool"), {"-I", "open", "mc", "info"});
-    ASSERT_EQ(info.exitCode, 0) << info.err;
     auto f = fields(info.out);
-    EXPECT_EQ(f["Device ID"], "32");
-    EXPECT_EQ(f["Device Revision"], "1");
     EXPECT_EQ(f["Firmware Revision"], "2.10");
-    EXPECT_EQ(f["IPMI Version"], "2.0");
-    EXPECT_EQ(f["Manufacturer ID"], "674");
     EXPECT_EQ(f["Manufacturer Name"], "Dell Inc.");
     EXPECT_EQ(f["Product ID"], "256 (0x0100)");
-    EXPECT_EQ(f["Device Available"], "yes");
     EXPECT_EQ(f["Provides Device SDRs"], "no");
     for (const char* device : {"Sensor Device", "SDR Repository Device", "SEL Device", "FRU Inventory Device",
                                "IPMB Event Receiver", "IPMB Event Generator", "Chassis Device"})
         EXPECT_NE(info.out.find("    " + std::string(device) + "\n"), std::string::npos) << device;
     EXPECT_EQ(info.out.find("    Bridge\n"), std::string::npos);
 
-    ToolRun raw = runTool("default", toolPath("ipmitool"), {"-I", "open", "raw", "0x06", "0x01"});
-    ASSERT_EQ(raw.exitCode, 0) << raw.err;
-    EXPECT_EQ(trim(raw.out), "20 01 02 10 02 bf a2 02 00 00 01 00 00 00 00");
+    f = fields(runTool("default", toolPath("bmc-info"), {"--driver-type=OPENIPMI"}).out);
+    EXPECT_EQ(f["Device Available"], "yes (normal operation)");
+    EXPECT_EQ(f["Manufacturer ID"], "Dell Inc. (674)");
+    EXPECT_EQ(f["Bridge"], "unsupported");
 }
 
-TEST(PeerTools, IpmitoolShowsACapturedIdentity) {
+// ipmi_sim reads numbers without 0x as decimal: mc_add 0x20 33 no-device-sdrs 0x1 1 33 0xbf 0x157 0x6f.
+TEST(PeerTools, IpmitoolSeesACapturedIdentity) {
     SKIP_WITHOUT_TOOL("ipmitool");
-    std::string profile = TestSupport::realDataPath("sim/infrasim_s2600wtt.emu");
+    std::string profile = realDataPath("sim/infrasim_s2600wtt.emu");
     SKIP_WITHOUT_REAL_DATA(profile);
-    // mc_add 0x20 33 no-device-sdrs 0x1 1 33 0xbf 0x157 0x6f: decimal where no 0x is written.
     ToolRun raw = runTool(profile, toolPath("ipmitool"), {"-I", "open", "raw", "0x06", "0x01"});
     ASSERT_EQ(raw.exitCode, 0) << raw.err;
     EXPECT_EQ(trim(raw.out), "21 01 01 21 02 bf 57 01 00 6f 00 00 00 00 00");
-    auto f = fields(runTool(profile, toolPath("ipmitool"), {"-I", "open", "mc", "info"}).out);
-    EXPECT_EQ(f["Firmware Revision"], "1.21");
-    EXPECT_EQ(f["Manufacturer Name"], "Intel Corporation");
-}
-
-TEST(PeerTools, FreeIpmiBmcInfoShowsTheDefaultIdentity) {
-    SKIP_WITHOUT_TOOL("bmc-info");
-    ToolRun info = runTool("default", toolPath("bmc-info"), {"--driver-type=OPENIPMI"});
-    ASSERT_EQ(info.exitCode, 0) << info.err;
-    auto f = fields(info.out);
-    EXPECT_EQ(f["Device ID"], "32");
-    EXPECT_EQ(f["Device Revision"], "1");
-    EXPECT_EQ(f["Device SDRs"], "unsupported");
-    EXPECT_EQ(f["Firmware Revision"], "2.10");
-    EXPECT_EQ(f["Device Available"], "yes (normal operation)");
-    EXPECT_EQ(f["IPMI Version"], "2.0");
-    EXPECT_EQ(f["Manufacturer ID"], "Dell Inc. (674)");
-    EXPECT_EQ(f["Product ID"], "256");
-    EXPECT_EQ(f["Bridge"], "unsupported");
-    EXPECT_EQ(f["Chassis Device"], "supported");
 }
 
 std::string setName(const std::string& set) { return set.substr(set.rfind('/') + 1); }
 
 class PeerToolsReference : public ::testing::TestWithParam<std::string> {
 protected:
-    void SetUp() override {
-        profile_ = referenceProfile(GetParam());
-    }
+    void SetUp() override { profile_ = referenceProfile(GetParam()); }
     std::string reference(const char* tool) { return realDataPath("sdr/" + setName(GetParam()) + "." + tool + ".txt"); }
     std::string profile_;
 };
@@ -135,18 +114,14 @@ TEST(PeerTools, IpmitoolDecodesTheDefaultServer) {
     // Every record but the three entity associations and two OEM records has a row.
     EXPECT_EQ(lines(elist.out).size(), 32u) << elist.out;
     for (const char* row : {
-             "BMC              | 00h | ok  |  7.1 | Dynamic MC @ 20h",
              "ME               | 00h | ok  | 46.1 | Dynamic MC @ 2Ch",
              "PS1              | 00h | ns  | 10.1 | Logical FRU @01h",
              // Two's complement with lower thresholds below 0 C. ipmi_sim compares
              // such readings as unsigned bytes and would show 22 C as 'lcr'.
              "Inlet Temp       | 01h | ok  | 55.1 | 22 degrees C",
-             "CPU1 VCORE       | 13h | ok  |  3.1 | 1.15 Volts",
              "Fan2             | 31h | ok  | 29.2 | 6060 RPM",
              "PS1 Input Power  | 40h | ok  | 10.1 | 232 Watts",
              "PS2 Input Power  | 41h | ns  | 10.2 | No Reading",
-             "PS1 Current      | 42h | ok  | 10.1 | 1 Amps",
-             "PS1 Status       | 50h | ok  | 10.1 | Presence detected",
              "DIMM B           | 64h | ok  | 32.5 | Presence Detected",
              "Drive            | 70h | ok  |  4.1 | Drive Present",
              "OS Watchdog      | 92h | ns  |  7.1 | Event-Only",
@@ -172,12 +147,9 @@ TEST(PeerTools, FreeIpmiDecodesTheDefaultServer) {
     }
     EXPECT_EQ(rows.size(), 25u) << sensors.out;  // every full and compact sensor record
     EXPECT_EQ(rows["Inlet Temp"], " Temperature              | 22.00      | C     | 'OK'");
-    EXPECT_EQ(rows["Exhaust Temp"], " Temperature              | 34.00      | C     | 'OK'");
-    EXPECT_EQ(rows["CPU2 VCORE"], " Voltage                  | 1.14       | V     | 'OK'");
     EXPECT_EQ(rows["Pwr Consumption"], " Current                  | 220.00     | W     | 'OK'");
     EXPECT_EQ(rows["PS2 Input Power"], " Other Units Based Sensor | N/A        | W     | N/A");
     EXPECT_EQ(rows["CPU"], " Processor                | N/A        | N/A   | 'Processor Presence detected'");
-    EXPECT_EQ(rows["Intrusion"], " Physical Security        | N/A        | N/A   | 'OK'");
 }
 
 // ipmi_sim answers 0xCC for a sensor it does not have; a BMC answers 0xCB.
