@@ -73,7 +73,8 @@ protected:
     }
 };
 
-TEST_F(SensorTest, ReadingIsAskedOfTheSensorsOwner) {
+// Satellite owners are SensorDiscovery's and SensorOwner's.
+TEST_F(SensorTest, ReadingIsAskedOfTheBmcUnlessSoftwareOwnsTheSensor) {
     auto s = threshold();
     EXPECT_EQ(42u, s.getReading());
     EXPECT_FALSE(sim().requests().back().viaIpmb);
@@ -81,17 +82,6 @@ TEST_F(SensorTest, ReadingIsAskedOfTheSensorsOwner) {
     std::string when;
     s.getReadingTime(when);
     EXPECT_TRUE(when.size() == 20 && when[4] == '-' && when[10] == 'T' && when[19] == 'Z') << when;
-
-    // A satellite controller on IPMB channel 6, LUN 1; the target address is put back.
-    model().owner = 0x2C;
-    model().channel = 6;
-    model().lun = 1;
-    node().targetAddress = 0x20;
-    EXPECT_EQ(42u, sensorOf<IpmiThresholdSensor>(thresholdRecord().set(sdr::key::ownerId, 0x2C).set(sdr::key::ownerLun, 0x61))
-                       .getReading());
-    const Sim::Request remote = sim().requests().back();
-    EXPECT_TRUE(remote.viaIpmb && remote.address == 0x2C && remote.channel == 6 && remote.lun == 1);
-    EXPECT_EQ(0x20u, node().targetAddress);
 
     const unsigned before = sim().totalExchanges();  // a software-owned sensor is never asked
     EXPECT_EQ(0u, sensorOf<IpmiThresholdSensor>(thresholdRecord().set(sdr::key::ownerId, 0x41)).getReading());
@@ -194,19 +184,17 @@ TEST_F(SensorTest, EventEnablesAndRearmLimitTheMasksByClass) {
     EXPECT_EQ((Bytes{kNumber, 0x80, 0xFF, 0x0F, 0xFF, 0x0F}), lastRequest());
     EXPECT_EQ(0, t.setEventEnable(0x90, 0xF234, 0x0FFF));  // enable selected
     EXPECT_EQ((Bytes{kNumber, 0x90, 0x34, 0x02, 0xFF, 0x0F}), lastRequest());
-    unsigned char flags = 0;
-    unsigned short assertMask = 0xAAAA, deassertMask = 0xBBBB;
-    EXPECT_EQ(0, t.getEventEnable(flags, assertMask, deassertMask));
-    EXPECT_EQ(0x80, flags);
-    EXPECT_EQ(0x0234, assertMask);
-    EXPECT_EQ(0x0FFF, deassertMask);
+    auto enables = [&t] {  // rc, flags, assertion and deassertion masks
+        unsigned char flags = 0;
+        unsigned short assertMask = 0xAAAA, deassertMask = 0xBBBB;
+        const int rc = t.getEventEnable(flags, assertMask, deassertMask);
+        return std::vector<int>{rc, flags, assertMask, deassertMask};
+    };
+    EXPECT_EQ(enables(), (std::vector<int>{0, 0x80, 0x0234, 0x0FFF}));
     model().eventFlags = 0x40;  // scanning only
-    EXPECT_EQ(0, t.getEventEnable(flags, assertMask = 0xAAAA, deassertMask = 0xBBBB));
-    EXPECT_EQ(0x40, flags);
-    EXPECT_EQ(0xAAAA, assertMask);
-    EXPECT_EQ(0xBBBB, deassertMask);
+    EXPECT_EQ(enables(), (std::vector<int>{0, 0x40, 0xAAAA, 0xBBBB}));
     sim().addFault(se, cmd::getSensorEventEnable, Fault::completionCode(cc::invalidCommand));
-    EXPECT_EQ(1, t.getEventEnable(flags, assertMask, deassertMask));
+    EXPECT_EQ(enables()[0], 1);
 
     model().eventReadingType = 0x6F;
     EXPECT_EQ(0, discrete().rearmEvents(0xFFFF, 0xFFFF));
@@ -217,26 +205,25 @@ TEST_F(SensorTest, EventEnablesAndRearmLimitTheMasksByClass) {
 
 TEST_F(SensorTest, HysteresisIsCachedUntilAskedAfresh) {
     auto t = threshold();
-    unsigned char positive = 9, negative = 9;
-    EXPECT_EQ(0, t.getHysteresis(positive, negative, false));  // never fetched: nothing asked
-    EXPECT_EQ(std::make_pair(0, 0), std::make_pair(int(positive), int(negative)));
+    auto hysteresis = [&t](bool fresh) {  // rc, positive, negative
+        unsigned char positive = 9, negative = 9;
+        const int rc = t.getHysteresis(positive, negative, fresh);
+        return std::vector<int>{rc, positive, negative};
+    };
+    EXPECT_EQ(hysteresis(false), (std::vector<int>{0, 0, 0}));  // never fetched: nothing asked
     EXPECT_EQ(0u, sim().totalExchanges());
 
     t.cacheHysteresis();
     EXPECT_EQ((Bytes{kNumber, 0xFF}), lastRequest());
-    EXPECT_EQ(0, t.getHysteresis(positive, negative, false));
-    EXPECT_EQ(std::make_pair(2, 3), std::make_pair(int(positive), int(negative)));
+    EXPECT_EQ(hysteresis(false), (std::vector<int>{0, 2, 3}));
     EXPECT_EQ(0, t.setHysteresis(4, 5));
     EXPECT_EQ((Bytes{kNumber, 0xFF, 4, 5}), lastRequest());
-    EXPECT_EQ(0, t.getHysteresis(positive, negative, false));
-    EXPECT_EQ(2, positive) << "setting does not touch the cache";
-    EXPECT_EQ(0, t.getHysteresis(positive, negative, true));
-    EXPECT_EQ(4, positive);
+    EXPECT_EQ(hysteresis(false), (std::vector<int>{0, 2, 3})) << "setting does not touch the cache";
+    EXPECT_EQ(hysteresis(true), (std::vector<int>{0, 4, 5}));
 
     sim().addFault(se, cmd::getSensorHysteresis, Fault::completionCode(cc::nodeBusy));
-    EXPECT_EQ(cc::nodeBusy, t.getHysteresis(positive, negative, true));
-    EXPECT_EQ(cc::nodeBusy, t.getHysteresis(positive, negative, false));
-    EXPECT_EQ(4, positive);
+    EXPECT_EQ(hysteresis(true), (std::vector<int>{cc::nodeBusy, 9, 9}));
+    EXPECT_EQ(hysteresis(false)[0], cc::nodeBusy);
 }
 
 }  // namespace
