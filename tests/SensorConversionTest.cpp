@@ -41,14 +41,8 @@ SdrBuilder compactRecord() {
 IpmiThresholdSensor sensorOf(Bytes r) { return IpmiThresholdSensor(0, r.data(), static_cast<int>(r.size())); }
 
 TEST(SensorConversion, RawValuesConvertToUnitsAndBack) {
-    const struct {
-        unsigned m, b;
-        int rExp, bExp;
-        uint8_t format;
-        unsigned raw;
-        double value;
-        unsigned back;  // convertToRawValue(value)
-    } cases[] = {
+    // back: convertToRawValue(value)
+    const struct { unsigned m, b; int rExp, bExp; uint8_t format; unsigned raw; double value; unsigned back; } cases[] = {
         {2, 0, -1, 0, kUnsigned, 100, 20.0, 100},
         {0x300, 0, 0, 0, kUnsigned, 1, -256.0, 1},  // M is 10-bit two's complement
         {0x1FF, 0, 0, 0, kUnsigned, 1, 511.0, 1},
@@ -92,8 +86,16 @@ TEST(SensorConversion, InverseKeepsItsQuirks) {
         << "no M check: a division by zero";
 }
 
-TEST(SensorConversion, OnlyFullAnalogRecordsConvert) {
+// Only full analog records convert; the range flags are tested only on records that are not full.
+TEST(SensorConversion, OnlyFullAnalogRecordsConvertOrHaveRanges) {
     LogCapture log;
+    auto full = sensorOf(fullRecord()  // no analog characteristic flags set
+                             .set(sdr::full::normalMin, 7).set(sdr::full::normalMax, 9).set(sdr::full::nominalReading, 8)
+                             .set(sdr::full::sensorMin, 1).set(sdr::full::sensorMax, 200));
+    EXPECT_EQ((std::vector<double>{7, 9, 8, 1, 200}),
+              (std::vector<double>{full.getNormalMin(), full.getNormalMax(), full.getNominalReading(),
+                                   full.getMinReadable(), full.getMaxReadable()}));
+
     auto compact = sensorOf(compactRecord());
     EXPECT_DOUBLE_EQ(0.0, compact.convertRawValue(10));
     EXPECT_TRUE(log.contains(LOG_ERR, "convertRawValue: request but not a full sensor"));
@@ -101,27 +103,9 @@ TEST(SensorConversion, OnlyFullAnalogRecordsConvert) {
     EXPECT_THROW(compact.getMinReadable(), kelInt::CmpiStatus);
     EXPECT_THROW(compact.getMaxReadable(), kelInt::CmpiStatus);
     EXPECT_EQ(log.count("CmpiStatus error 1 Not a Full sensor"), 2u);
-
-    auto none = sensorOf(fullRecord(1, 0, 0, 0, sdr::analogFormat::noAnalogReading));
-    EXPECT_DOUBLE_EQ(0.0, none.convertRawValue(10));
+    EXPECT_DOUBLE_EQ(0.0, compact.getNormalMin());
+    EXPECT_DOUBLE_EQ(0.0, sensorOf(fullRecord(1, 0, 0, 0, sdr::analogFormat::noAnalogReading)).convertRawValue(10));
     EXPECT_TRUE(log.contains(LOG_ERR, "convertRawValue: request against non-threshold sensor"));
-}
-
-TEST(SensorConversion, RangeFlagsAreTestedOnlyOnRecordsThatAreNotFull) {
-    LogCapture log;
-    auto full = sensorOf(fullRecord()  // no analog characteristic flags set
-                             .set(sdr::full::normalMin, 7)
-                             .set(sdr::full::normalMax, 9)
-                             .set(sdr::full::nominalReading, 8)
-                             .set(sdr::full::sensorMin, 1)
-                             .set(sdr::full::sensorMax, 200));
-    EXPECT_DOUBLE_EQ(7.0, full.getNormalMin());
-    EXPECT_DOUBLE_EQ(9.0, full.getNormalMax());
-    EXPECT_DOUBLE_EQ(8.0, full.getNominalReading());
-    EXPECT_DOUBLE_EQ(1.0, full.getMinReadable());
-    EXPECT_DOUBLE_EQ(200.0, full.getMaxReadable());
-
-    EXPECT_DOUBLE_EQ(0.0, sensorOf(compactRecord()).getNormalMin());
     auto flagged = sensorOf(compactRecord().set(sdr::full::analogFlags, sdr::bits::hasNormalMin |
                                                                            sdr::bits::hasNormalMax |
                                                                            sdr::bits::hasNominalReading));
@@ -141,25 +125,19 @@ TEST(SensorRecord, AccessorsReadTheirRecordType) {
                              .set(sdr::sensor::initialisation, 0x7F)
                              .set(sdr::sensor::capabilities, 0xC0)
                              .set(sdr::sensor::units1, 0x01));
-    EXPECT_EQ(6, full.getChannel());
-    EXPECT_EQ(1, full.getLun());
-    EXPECT_EQ(0x1234, full.getSensorRecordNumber());
+    EXPECT_EQ((std::vector<int>{6, 1, 0x1234, 0x11FB, false}),
+              (std::vector<int>{full.getChannel(), full.getLun(), full.getSensorRecordNumber(), full.getFlags(), full.isLinear()}));
     EXPECT_EQ(IpmiEntity(7, 3, 0, 0), full.getEntity());
-    EXPECT_EQ(0, full.getSensorDirection()) << "a full record's direction is not consulted";
-    EXPECT_EQ(0x11FB, full.getFlags());
-    EXPECT_FALSE(full.isLinear());
 
     auto compact = sensorOf(compactRecord().set(sdr::compact::sharing, 0x40));
     EXPECT_EQ(1, compact.getSensorDirection());
     EXPECT_TRUE(compact.isLinear()) << "whatever the linearisation byte says";
 
     Bytes e = SdrBuilder::eventOnly().types(0x0C, 0x6F).set(sdr::eventOnly::sharing, 0x80);
-    auto eventOnly = IpmiDiscreteSensor(2, e.data(), static_cast<int>(e.size()));
-    EXPECT_EQ(0x0C, eventOnly.getSensorType());
-    EXPECT_EQ(0x6F, eventOnly.getEventReadingType());
-    EXPECT_EQ(2, eventOnly.getSensorDirection());
-    EXPECT_EQ(255, eventOnly.getEventMessageSupport());
-    EXPECT_EQ(0, eventOnly.getFlags());
+    auto eventOnly = IpmiDiscreteSensor(2, e.data(), static_cast<int>(e.size()));  // type, event/reading type,
+    EXPECT_EQ((std::vector<int>{0x0C, 0x6F, 2, 255, 0}),                            // direction, event support, flags
+              (std::vector<int>{eventOnly.getSensorType(), eventOnly.getEventReadingType(), eventOnly.getSensorDirection(),
+                                eventOnly.getEventMessageSupport(), eventOnly.getFlags()}));
 }
 
 TEST(SensorRecord, ShortOverlongAndMissingRecordsAreReadSafely) {

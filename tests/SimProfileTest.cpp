@@ -82,13 +82,14 @@ std::string fullRecordLine(uint8_t number, bool signedReadings) {
 }
 
 // Numbers are read as ipmi_sim reads them: 32 is decimal, 020 octal. Other
-// controllers on IPMB join once enabled.
-TEST(SimProfile, ControllersAndTheirIdentity) {
+// controllers on IPMB join once enabled. The SEL exists only when enabled.
+TEST(SimProfile, ControllersTheirIdentityAndSel) {
     ProfileDir dir;
     auto bmc = dir.load(
         "mc_setbmc 0x20\n"
         "mc_add 0x20 32 has-device-sdrs 0x1 2 020 0xdf 0x2a2 0x100 dynsens\n"
         "mc_enable 0x20\n"
+        "sel_enable 0x20 1000 0x0b\n"
         "mc_add 0x2c 0x50 no-device-sdrs 1 4 1 0x21 343 0x0b\n"
         "mc_enable 0x2c\n"
         "mc_add 0xb1 1 no-device-sdrs 1 0 0 159 0 0 dynsens\n");
@@ -97,6 +98,10 @@ TEST(SimProfile, ControllersAndTheirIdentity) {
     ASSERT_EQ(bmc->satellites.size(), 1u);
     EXPECT_EQ(bmc->satellites.at(0x2c).deviceId, 0x50);
     EXPECT_EQ(bmc->satellites.at(0x2c).manufacturerId, 343u);
+    const Sim::Response sel = ask(*bmc, netfn::storage, cmd::getSelInfo);
+    ASSERT_EQ(sel.size(), 15u);
+    EXPECT_EQ(sel[14], 0x0b);
+    EXPECT_EQ(ask(*dir.load(kBmc), netfn::storage, cmd::getSelInfo), Sim::Response{cc::invalidCommand});
 }
 
 // Commands the model has no place for (ATCA, device SDRs, SEL entries, GUID, sleep) are skipped.
@@ -150,14 +155,6 @@ TEST(SimProfile, SensorsAnswerAsTheProfileSetsThem) {
     // 22 C is above -2 C (as unsigned bytes it would be below 0xfe); -8 C is at or below both lower ones.
     EXPECT_EQ(reading(*bmc, 1)[3], 0x00);
     EXPECT_EQ(reading(*bmc, 2)[3], 0x03);
-}
-
-TEST(SimProfile, TheSelExistsOnlyWhenEnabled) {
-    ProfileDir dir;
-    EXPECT_EQ(ask(*dir.load(kBmc), netfn::storage, cmd::getSelInfo), Sim::Response{cc::invalidCommand});
-    Sim::Response info = ask(*dir.load(kBmc + "sel_enable 0x20 1000 0x0b\n"), netfn::storage, cmd::getSelInfo);
-    ASSERT_EQ(info.size(), 15u);
-    EXPECT_EQ(info[14], 0x0b);
 }
 
 TEST(SimProfile, SyntaxErrorsNameTheFileAndLine) {
