@@ -48,9 +48,9 @@ protected:
         SimTest::TearDown();
     }
 
-    // Files records as the repository reader does, each at the head of its
-    // group: a group lists its records last first. Arguments in repository order.
-    void repository(const std::vector<Bytes>& records) {
+    // Files records as the repository reader does, each at the head of its group
+    // (a group lists its records last first), then builds the tree from them.
+    void tree(const std::vector<Bytes>& records) {
         for (const auto& bytes : records) {
             auto* element = new ipmiifc_sdr_list();
             element->record_type = bytes.size() > sdr::header::recordType ? bytes[sdr::header::recordType] : 0;
@@ -59,18 +59,14 @@ protected:
             std::copy(bytes.begin(), bytes.end(), element->data);
             IpmiIfcSdrListAdd(0, element);
         }
+        IpmiIfcEntityListCreate(0);
+        IpmiIfcEntityInstantiateAll(0);
     }
     // The controller's repository, with record IDs in order, read through the whole refresh chain.
     void refreshChain(std::vector<Bytes> records) {
         for (size_t i = 0; i < records.size(); ++i) records[i][sdr::header::recordId] = static_cast<uint8_t>(i + 1);
         bmc().sdr.records = records;
         ASSERT_EQ(IpmiIfcSdrGetInfo(0), 0u);
-    }
-
-    // The tree-building half of the SDR refresh chain.
-    void build() {
-        IpmiIfcEntityListCreate(0);
-        IpmiIfcEntityInstantiateAll(0);
     }
 
     static std::vector<EntityKey> entities() {
@@ -89,14 +85,13 @@ protected:
 
 // A range over every instance byte ends; device-relative duplicates collapse.
 TEST_F(EntityTree, RangeRecordContainsEveryInstanceInOrderMalformedRangesNothing) {
-    repository({
+    tree({
         association(kSystemChassis, 5, kRanges, {kFan, 0x7E, kFan, 0xFF}),
         association(kSystemChassis, 1, kRanges, {kSystemBoard, 1, kSystemBoard, 4}),
         association(kSystemChassis, 2, kRanges, {kSystemBoard, 1, kFan, 4}),          // IDs differ
         association(kSystemChassis, 3, kRanges, {kSystemBoard, 5, kSystemBoard, 4}),  // first above last
         association(kSystemChassis, 4, kRanges, {0, 1, 0, 2, kFan, 7, kFan, 7}),      // only the second range
     });
-    build();
     const auto all = entities();
     ASSERT_EQ(all.size(), 9u + 1u + 128u);
     EXPECT_THAT(std::vector<EntityKey>(all.begin(), all.begin() + 13),
@@ -104,22 +99,23 @@ TEST_F(EntityTree, RangeRecordContainsEveryInstanceInOrderMalformedRangesNothing
                             Pair(kSystemChassis, 1), Pair(kSystemBoard, 1), Pair(kSystemBoard, 2),
                             Pair(kSystemBoard, 3), Pair(kSystemBoard, 4), Pair(kSystemChassis, 5), Pair(kFan, 0x7E),
                             Pair(kFan, 0x7F), Pair(kFan, 0x00)));
-    EXPECT_EQ(parentOf(kSystemBoard, 3), EntityKey(kSystemChassis, 1));
 }
 
 TEST_F(EntityTree, ListRecordsSkipEmptySlotsShareTheirContainerAndRefuseDuplicates) {
-    repository({
+    tree({
         association(kSystemChassis, 1, 0, {kPowerSupply, 3, 0, 0, kPowerSupply, 4, 0, 0}),
         association(kSystemChassis, 1, 0, {kPowerSupply, 2, kFan, 1, kPowerSupply, 3}),
         association(kSystemChassis, 0x81, 0, {kPowerSupply, 0x81, kPowerSupply, 2}),  // device-relative: the same
     });
-    build();
     EXPECT_THAT(entities(), ElementsAre(Pair(kSystemChassis, 1), Pair(kPowerSupply, 1), Pair(kPowerSupply, 2),
                                         Pair(kFan, 1), Pair(kPowerSupply, 3), Pair(kPowerSupply, 4)));
 }
 
-TEST_F(EntityTree, SensorEntitiesNotYetInTheTreeFollowTheContainers) {
-    repository({
+// An entity that is a container itself answers as top-level, even where
+// another container lists it.
+TEST_F(EntityTree, SensorEntitiesNotYetInTheTreeFollowTheContainersParentsAnswerFromTheTree) {
+    tree({
+        association(kSystemChassis, 1, 0, {kSystemBoard, 1}),
         sensorRecord(sdr::type::fullSensor, kProcessor, 1),
         association(kSystemBoard, 1, 0, {kProcessor, 1, kMemoryModule, 1}),
         sensorRecord(sdr::type::eventOnly, kFan, 2),
@@ -129,27 +125,17 @@ TEST_F(EntityTree, SensorEntitiesNotYetInTheTreeFollowTheContainers) {
         sensorRecord(sdr::type::fullSensor, kPowerSupply, 0x82),  // device-relative
         sensorRecord(sdr::type::eventOnly, kFan, 1),              // added by the compact one
     });
-    build();
     EXPECT_THAT(entities(), ElementsAre(Pair(kSystemBoard, 1), Pair(kProcessor, 1), Pair(kMemoryModule, 1),
+                                        Pair(kSystemChassis, 1), Pair(kSystemBoard, 1),  // container and child
                                         Pair(kPowerSupply, 2), Pair(kFan, 1), Pair(kFan, 2)));
-}
-
-// An entity that is a container itself answers as top-level, even where
-// another container lists it.
-TEST_F(EntityTree, ParentOfContainedTopLevelAndUnknownEntities) {
-    repository({association(kSystemChassis, 1, 0, {kPowerSupply, 1, kFan, 3, kSystemBoard, 1}),
-                association(kSystemBoard, 1, 0, {kProcessor, 1}), sensorRecord(sdr::type::fullSensor, kProcessor, 2)});
-    build();
-    EXPECT_EQ(parentOf(kFan, 3), EntityKey(kSystemChassis, 1));
-    EXPECT_EQ(parentOf(kFan, 0x83), EntityKey(kSystemChassis, 1));  // device-relative bit ignored
     EXPECT_EQ(parentOf(kProcessor, 1), EntityKey(kSystemBoard, 1));
+    EXPECT_EQ(parentOf(kMemoryModule, 0x81), EntityKey(kSystemBoard, 1));  // device-relative bit ignored
     EXPECT_EQ(parentOf(kSystemBoard, 1), kNoParent);
     EXPECT_EQ(parentOf(kSystemChassis, 1), kNoParent);
-    EXPECT_EQ(parentOf(kProcessor, 2), kNoParent);
+    EXPECT_EQ(parentOf(kFan, 2), kNoParent);  // a sensor entity is in no container
     EXPECT_EQ(parentOf(kFan, 4), kNoParent);
-    EXPECT_EQ(parentOf(0x100 + kFan, 3), kNoParent);  // not an entity ID at all
-
-    EXPECT_EQ(IpmiIfc::getEntityParent(1, kPowerSupply, 1), IpmiEntity());  // node 1 has no tree
+    EXPECT_EQ(parentOf(0x100 + kProcessor, 1), kNoParent);  // not an entity ID at all
+    EXPECT_EQ(IpmiIfc::getEntityParent(1, kProcessor, 1), IpmiEntity());  // node 1 has no tree
     EXPECT_TRUE(IpmiIfc::getEntities(7).empty());
 }
 
@@ -158,12 +144,11 @@ TEST_F(EntityTree, ShortRecordsGiveOnlyWhatTheyHold) {
         r.resize(length);
         return r;
     };
-    repository({cut(association(kSystemChassis, 1, 0, {kFan, 1, kFan, 2, kFan, 3}), 13),  // inside the third pair
+    tree({cut(association(kSystemChassis, 1, 0, {kFan, 1, kFan, 2, kFan, 3}), 13),  // inside the third pair
                 cut(association(kSystemChassis, 2, kRanges, {kFan, 4, kFan, 5, kFan, 6, kFan, 7}), 14),
                 cut(association(kSystemChassis, 3, kRanges, {kFan, 8, kFan, 8}), 7),  // no flags
                 cut(association(kSystemChassis, 4, 0, {kFan, 9}), 6),                 // no container instance
                 cut(sensorRecord(sdr::type::fullSensor, kProcessor, 1), 9)});       // no entity instance
-    build();
     EXPECT_THAT(entities(), ElementsAre(Pair(kSystemChassis, 3), Pair(kSystemChassis, 2), Pair(kFan, 4),
                                         Pair(kFan, 5), Pair(kSystemChassis, 1), Pair(kFan, 1), Pair(kFan, 2)));
 }
