@@ -158,9 +158,8 @@ TEST_F(SdrReader, RefreshFilesEveryRecordInItsGroupWithTheExchangesTheWalkNeeds)
     EXPECT_THAT(getSdrs(), testing::StartsWith("a:0@0+5 a:101@0+5 a:102@0+5 "));  // the walk follows the next ids
     EXPECT_EQ(readerLines(), 0u) << log.dump();
     const ipmiifc_sdr_info info = IpmiIfc::getSdr(0);
-    EXPECT_EQ(info.record_count, records.size());
-    EXPECT_EQ(info.addition_timestamp, 0x11223344u);
-    EXPECT_EQ(info.erase_timestamp, 0x55667788u);
+    EXPECT_EQ((std::vector<size_t>{info.record_count, info.addition_timestamp, info.erase_timestamp}),
+              (std::vector<size_t>{records.size(), 0x11223344u, 0x55667788u}));
 
     IpmiIfcSdrCleanUpAll(0);
     IpmiIfcSdrCleanUpHeaders(0);

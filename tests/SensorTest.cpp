@@ -59,7 +59,7 @@ protected:
         return sensorOf<IpmiDiscreteSensor>(thresholdRecord().set(sdr::sensor::capabilities, 0).types(0x07, 0x6F));
     }
     Bytes lastRequest() { return sim().requests().back().data; }
-    // The message of the CmpiStatus that `call` throws, as logged.
+    // The message of the CmpiStatus that `call` throws, as logged (msg() reads "(null)" without a broker).
     std::string failureOf(const std::function<void()>& call) {
         log.clear();
         try {
@@ -89,6 +89,7 @@ TEST_F(SensorTest, ReadingIsAskedOfTheBmcUnlessSoftwareOwnsTheSensor) {
     EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiSensor::getSDReading no value read for sensor 5"));
 }
 
+// A failed reading is logged and thrown by the state getters; an absent sensor is no error.
 TEST_F(SensorTest, StatesFollowTheReading) {
     auto t = threshold();
     int state = -1;
@@ -112,18 +113,14 @@ TEST_F(SensorTest, StatesFollowTheReading) {
     EXPECT_TRUE(d.getSensorState(state));
     EXPECT_EQ(5, state) << "no state asserted is OK";
 
-    model().present = false;  // an absent sensor is not an error
+    model().present = false;
     EXPECT_FALSE(t.getSensorState(state));
     EXPECT_EQ(0, state);
     EXPECT_EQ(0u, t.getState(true));
     EXPECT_EQ(0u, log.count("IpmiSensor::getSDReading no value read for sensor 5"));
-}
 
-TEST_F(SensorTest, AFailedReadingIsLoggedAndThrownByTheStateGetters) {
     sim().addFault(se, cmd::getSensorReading, Fault::completionCode(cc::nodeBusy, -1));
-    auto t = threshold();
-    int state = -1;
-    EXPECT_TRUE(t.getSensorState(state));
+    EXPECT_TRUE(t.getSensorState(state = -1));
     EXPECT_EQ(0, state);
     EXPECT_TRUE(log.contains(LOG_WARNING,
                              "IpmiSensor::getSDReading: unexpected return cc code for node: 0 cmd: 45/4 was 0xc0"));
@@ -132,7 +129,7 @@ TEST_F(SensorTest, AFailedReadingIsLoggedAndThrownByTheStateGetters) {
     EXPECT_EQ("Discrete Sensor reading not available", failureOf([&] { discrete().getState(true); }));
 }
 
-TEST_F(SensorTest, ThresholdGettersAskTheControllerAndConvert) {
+TEST_F(SensorTest, ThresholdsAreReadConvertedAndSetWhereSettable) {
     auto s = threshold();
     EXPECT_DOUBLE_EQ(90.0, s.getUpperCriticalThreshold(true));
     EXPECT_EQ(cmd::getSensorThresholds, sim().requests().back().cmd);
@@ -152,10 +149,8 @@ TEST_F(SensorTest, ThresholdGettersAskTheControllerAndConvert) {
               failureOf([&] { partly.getUpperNonRecoverableThreshold(); }));
     EXPECT_EQ("Not a threshold sensor", failureOf([&] { discrete().getUpperCriticalThreshold(); }));
     EXPECT_EQ(before, sim().totalExchanges());
-}
 
-TEST_F(SensorTest, SetThresholdsSendsOnlySettableNonZeroValues) {
-    auto s = threshold();
+    // Only settable non-zero values are sent.
     EXPECT_EQ(0, s.setThresholds(1.0, 12.0, 3.0, 0.0, 95.0, 0.0));
     EXPECT_EQ(cmd::setSensorThresholds, sim().requests().back().cmd);
     EXPECT_EQ((Bytes{kNumber, 0x12, 0, 12, 0, 0, 95, 0}), lastRequest());
@@ -168,10 +163,10 @@ TEST_F(SensorTest, SetThresholdsSendsOnlySettableNonZeroValues) {
     EXPECT_EQ(10, model().thresholds[1]);
     sim().addFault(se, cmd::setSensorThresholds, Fault::completionCode(cc::invalidCommand));
     EXPECT_EQ(1, s.setThresholds(0.0, 0.0, 0.0, 0.0, 91.0, 0.0));
-    const unsigned before = sim().totalExchanges();
+    const unsigned unchanged = sim().totalExchanges();
     EXPECT_EQ(1, discrete().setThresholds(1.0, 1.0, 1.0, 1.0, 1.0, 1.0));
     EXPECT_EQ(1, discrete().restoreDefaultThresholds());
-    EXPECT_EQ(before, sim().totalExchanges());
+    EXPECT_EQ(unchanged, sim().totalExchanges());
 }
 
 // Event masks in the enable and re-arm commands keep 12 bits for a threshold
