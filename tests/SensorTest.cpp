@@ -25,14 +25,11 @@ constexpr uint8_t se = netfn::sensorEvent;
 // thresholds readable, LC and UC settable (defaults 10 and 90), hysteresis settable.
 SdrBuilder thresholdRecord() {
     return SdrBuilder::full()
-        .set(sdr::key::sensorNumber, kNumber)
+        .set(sdr::key::sensorNumber, kNumber).types(0x01, sdr::eventReadingTypeThreshold)
         .set(sdr::sensor::capabilities, 0x28)  // hysteresis settable, thresholds readable and settable
-        .types(0x01, sdr::eventReadingTypeThreshold)
         .set(sdr::sensor::readableThresholds, 0x3F)
         .set(sdr::sensor::settableThresholds, sdr::bits::lowerCritical | sdr::bits::upperCritical)
-        .set(sdr::full::mLow, 1)
-        .set(sdr::full::upperCritical, 90)
-        .set(sdr::full::lowerCritical, 10);
+        .set(sdr::full::mLow, 1).set(sdr::full::upperCritical, 90).set(sdr::full::lowerCritical, 10);
 }
 
 class SensorTest : public TestSupport::SimTest {
