@@ -24,8 +24,7 @@ constexpr uint8_t se = netfn::sensorEvent;
 constexpr uint8_t kFull = sdr::type::fullSensor, kCompact = sdr::type::compactSensor, kEventOnly = sdr::type::eventOnly;
 constexpr uint8_t kThreshold = sdr::eventReadingTypeThreshold;
 constexpr uint8_t kSensorSpecific = 0x6F;
-constexpr uint8_t kMemory = 0x0C;
-constexpr uint8_t kBios = 0x22;
+constexpr uint8_t kMemory = 0x0C, kBios = 0x22;
 
 // A record of sensor `number`, whose record ID is the number too.
 SdrBuilder record(uint8_t recordType, uint8_t number, uint8_t eventReadingType = kThreshold, uint8_t sensorType = 1) {
@@ -88,11 +87,6 @@ protected:
             if (s->getSensorNumber() == number) return s;
         return nullptr;
     }
-    static std::vector<int> numbers(const SensorList& list) {
-        std::vector<int> out;
-        for (const auto& s : list) out.push_back(s->getSensorNumber());
-        return out;
-    }
     static std::string skipping(uint8_t number) {
         return "Skipping reading update for previous failed sensor 0x" + std::to_string(number);  // numbers below 10
     }
@@ -100,39 +94,42 @@ protected:
 
 using SensorRefresh = SensorDiscovery;
 
-// Full sensors come first although the compact records lead the repository;
-// each group lists its records newest first.
-TEST_F(SensorDiscovery, EventReadingTypeChoosesTheClassOrDropsTheRecord) {
+// Full sensors come first although the compact records lead the repository,
+// event-only ones last; each group lists its records newest first.
+TEST_F(SensorDiscovery, TypesChooseTheClassOrDropTheRecordDiscreteOnesOfEntityZeroAndBiosAreHidden) {
     add(record(kCompact, 12, 0x6E));
     add(record(kCompact, 13, kSensorSpecific));
+    add(record(kCompact, 17, kSensorSpecific).set(sdr::key::entityId, 0x00));
     const uint8_t types[] = {0x01, 0x02, 0x0C, 0x6F, 0x70, 0x75, 0x7F, 0x00, 0x0D, 0x6E, 0x80};
     for (uint8_t n = 1; n <= 11; ++n) add(record(kFull, n, types[n - 1]));
     Bytes cut = record(kFull, 14, kSensorSpecific);  // ends before its event/reading type
     cut.resize(sdr::sensor::eventReadingType);
     cut[sdr::header::remainingLength] = static_cast<uint8_t>(cut.size() - sdr::header::length);
     add(cut);
+    add(record(kFull, 15).set(sdr::key::entityId, kBios));
+    add(record(kFull, 16, kSensorSpecific).set(sdr::key::entityId, kBios));
+    const uint8_t eventOnlyTypes[] = {kThreshold, kSensorSpecific, 0x05, 0x75, 0x00, 0x40};
+    for (uint8_t n = 21; n <= 26; ++n) add(record(kEventOnly, n, eventOnlyTypes[n - 21]));
+    // The OEM range is looked for in byte 13, not in the event/reading type.
+    bmc().sdr.records.back()[sdr::eventOnly::instanceModifier] = 0x72;
+    add(record(kEventOnly, 27, kSensorSpecific).set(sdr::key::entityId, kBios));
 
-    const SensorList sensors = discover();
+    std::vector<std::pair<int, bool>> seen;
+    for (const auto& s : discover()) seen.emplace_back(s->getSensorNumber(), s->isDiscrete());
 
-    EXPECT_EQ(numbers(sensors), (std::vector<int>{7, 6, 5, 4, 3, 2, 1, 13}));
-    for (const auto& s : sensors) EXPECT_EQ(s->isDiscrete(), s->getSensorNumber() != 1) << s->getSensorNumber();
+    EXPECT_EQ(seen, (std::vector<std::pair<int, bool>>{{15, false}, {7, true}, {6, true}, {5, true}, {4, true},
+                                                       {3, true}, {2, true}, {1, false}, {13, true}, {26, true},
+                                                       {23, true}, {22, true}, {21, false}}));
     EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, full event_type 0 (ID: 8, Type 1)\n"));
     EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, full event_type 6e (ID: a, Type 1)\n"));
     EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, full event_type 80 (ID: b, Type 1)\n"));
     EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, full event_type 0 (ID: e, Type 1)\n"));
     EXPECT_TRUE(log.contains(LOG_DEBUG, "dropping sdr, compact event_type 110, full event_type 110\n"));
+    // Event-only sensors are never read; a threshold one has its thresholds asked.
+    for (uint8_t n = 21; n <= 27; ++n) EXPECT_EQ(asks(n), (std::vector<unsigned>{0, n == 21, 0})) << int(n);
 }
 
-TEST_F(SensorDiscovery, DiscreteSensorsOfEntityZeroAndBiosAreHiddenThresholdOnesAreNot) {
-    add(record(kFull, 1).set(sdr::key::entityId, kBios));
-    add(record(kFull, 2, kSensorSpecific).set(sdr::key::entityId, kBios));
-    add(record(kCompact, 3, kSensorSpecific).set(sdr::key::entityId, 0x00));
-    add(record(kCompact, 4, kSensorSpecific));
-    add(record(kEventOnly, 5, kSensorSpecific).set(sdr::key::entityId, kBios));
-    EXPECT_EQ(numbers(discover()), (std::vector<int>{1, 4}));
-}
-
-TEST_F(SensorDiscovery, EachSensorIsReadOnceAndWhatWasReadIsKept) {
+TEST_F(SensorDiscovery, EachSensorIsReadOnceWhatWasReadIsKeptFailuresAreLoggedExceptAbsentAndIllegal) {
     Sim::SensorModel& t = add(record(kFull, 0x10).set(sdr::sensor::capabilities, 0x28));  // hysteresis settable
     t.states = sdr::bits::upperNonCritical;
     t.hysteresisPositive = 2;
@@ -161,6 +158,17 @@ TEST_F(SensorDiscovery, EachSensorIsReadOnceAndWhatWasReadIsKept) {
     sim().addFault(se, cmd::getSensorHysteresis, Fault::completionCode(cc::nodeBusy));
     discover();
     EXPECT_TRUE(log.contains(LOG_ERR, "IpmiIfcSensorGetThresholds: getHysteresis(0, 0, true) returned cc = 192"));
+
+    // Sensor 0x11 is asked first. 0xCB and 0xCD are never reported; 0xC1 only for the reading.
+    for (uint8_t code : {cc::nodeBusy, cc::invalidCommand, cc::requestedSensorNotPresent, cc::illegalForSensorType}) {
+        sim().addFault(se, cmd::getSensorThresholds, Fault::completionCode(code));
+        sim().addFault(se, cmd::getSensorReading, Fault::completionCode(code));
+        EXPECT_EQ(numbered(discover(), 0x11)->getLastPollResult(), code);
+    }
+    EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcSensorGetThresholds: Sensor Number = 0x11, failed send cc = 0xc0"));
+    EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcSensorGetReading: Sensor Number 0x11, failed send cc = 0xc0"));
+    EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcSensorGetReading: Sensor Number 0x11, failed send cc = 0xc1"));
+    EXPECT_EQ(log.countAtPriority(LOG_WARNING), 3u) << log.dump();
 }
 
 TEST_F(SensorDiscovery, RequestsGoToTheOwnerAndOnlyTheAddressIsPutBack) {
@@ -180,38 +188,6 @@ TEST_F(SensorDiscovery, RequestsGoToTheOwnerAndOnlyTheAddressIsPutBack) {
     EXPECT_EQ(node().targetAddress, 0u);
     EXPECT_EQ(node().targetChannel, 6);
     EXPECT_EQ(node().targetLun, 1);
-}
-
-TEST_F(SensorDiscovery, EventOnlyRecordsBecomeSensorsWithoutBeingRead) {
-    add(record(kEventOnly, 1));
-    add(record(kEventOnly, 2, kSensorSpecific));
-    add(record(kEventOnly, 3, 0x05));
-    // The OEM range is looked for in byte 13, not in the event/reading type.
-    add(record(kEventOnly, 4, 0x75));
-    add(record(kEventOnly, 5, 0x40).set(sdr::eventOnly::instanceModifier, 0x72));
-    add(record(kEventOnly, 6, 0x00));
-
-    std::vector<std::pair<int, bool>> seen;
-    for (const auto& s : discover()) seen.emplace_back(s->getSensorNumber(), s->isDiscrete());
-
-    EXPECT_EQ(seen, (std::vector<std::pair<int, bool>>{{5, true}, {3, true}, {2, true}, {1, false}}));
-    EXPECT_EQ(sim().exchanges(se, cmd::getSensorReading), 0u);
-    EXPECT_EQ(sim().exchanges(se, cmd::getSensorThresholds), 1u);
-    EXPECT_EQ(asked(cmd::getSensorThresholds, 1), 1u);
-}
-
-TEST_F(SensorDiscovery, FailedRequestsAreLoggedExceptAbsentAndIllegalSensors) {
-    add(record(kFull, 0x15));
-    for (uint8_t code : {cc::nodeBusy, cc::invalidCommand, cc::requestedSensorNotPresent, cc::illegalForSensorType}) {
-        sim().addFault(se, cmd::getSensorThresholds, Fault::completionCode(code));
-        sim().addFault(se, cmd::getSensorReading, Fault::completionCode(code));
-        EXPECT_EQ(discover().at(0)->getLastPollResult(), code);
-    }
-    // 0xCB and 0xCD are never reported; 0xC1 only for the reading.
-    EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcSensorGetThresholds: Sensor Number = 0x15, failed send cc = 0xc0"));
-    EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcSensorGetReading: Sensor Number 0x15, failed send cc = 0xc0"));
-    EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcSensorGetReading: Sensor Number 0x15, failed send cc = 0xc1"));
-    EXPECT_EQ(log.countAtPriority(LOG_WARNING), 3u) << log.dump();
 }
 
 // Each discovery builds a new list and clears the memory-events flag first;
@@ -360,39 +336,30 @@ TEST_F(SensorRefresh, OnlyATimeOutThatRepeatsThreeTimesStopsTheReads) {
     }
 }
 
-// Full sensors are listed newest record first: 3, 2 (software-owned), 1.
-TEST_F(SensorRefresh, SoftwareOwnedSensorIsNeverAskedAndEndsThePassWhereItStands) {
-    add(record(kFull, 1));
-    add(record(kFull, 2).set(sdr::key::ownerId, 0x41));  // bit 0: a software ID
+// Full sensors are listed newest record first: 3, 2, then 1 (software-owned).
+TEST_F(SensorRefresh, UnansweredRequestOrSoftwareOwnedSensorEndsThePassTheRestIsAskedNextTime) {
+    add(record(kFull, 1).set(sdr::key::ownerId, 0x41));  // bit 0: a software ID
+    add(record(kFull, 2));
     add(record(kFull, 3));
     add(record(kCompact, 4));
     const SensorList sensors = discover();
     ASSERT_EQ(sensors.size(), 4u);
-    EXPECT_EQ(asks(2), (std::vector<unsigned>{0, 0, 0}));
-    EXPECT_FALSE(numbered(sensors, 2)->hasReadingTime());
+    EXPECT_EQ(asks(1), (std::vector<unsigned>{0, 0, 0}));
+    EXPECT_FALSE(numbered(sensors, 1)->hasReadingTime());
     sim().resetCounters();
-
-    EXPECT_EQ(IpmiIfcSensorUpdateReading(0), -1);
-
-    EXPECT_EQ(asks(3), (std::vector<unsigned>{1, 1, 0}));
-    EXPECT_EQ(sim().totalExchanges(), 2u);
-    EXPECT_TRUE(log.contains(LOG_DEBUG, "IpmiIfcSensorUpdateReading: failed send to get reading."));
-}
-
-TEST_F(SensorRefresh, UnansweredRequestEndsThePassButIsAskedAgainNextTime) {
-    add(record(kFull, 1));
-    add(record(kFull, 2));
-    discoverThenCount();
     sim().addFault(se, cmd::getSensorReading, Fault::of(Sim::FaultKind::NoAnswer));
 
     EXPECT_EQ(IpmiIfcSensorUpdateReading(0), -1);
-    EXPECT_EQ(asks(2), (std::vector<unsigned>{1, 0, 0}));
-    EXPECT_EQ(readsOf(1), 0u);
+    EXPECT_EQ(asks(3), (std::vector<unsigned>{1, 0, 0}));
+    EXPECT_EQ(readsOf(2), 0u);
 
     sim().resetCounters();
-    EXPECT_EQ(IpmiIfcSensorUpdateReading(0), 0);
-    EXPECT_EQ(readsOf(2), 1u);
-    EXPECT_EQ(readsOf(1), 1u);
+    log.clear();
+    EXPECT_EQ(IpmiIfcSensorUpdateReading(0), -1);
+    EXPECT_EQ(asks(3), (std::vector<unsigned>{1, 1, 0}));
+    EXPECT_EQ(asks(2), (std::vector<unsigned>{1, 1, 0}));
+    EXPECT_EQ(sim().totalExchanges(), 4u);
+    EXPECT_TRUE(log.contains(LOG_DEBUG, "IpmiIfcSensorUpdateReading: failed send to get reading."));
 }
 
 }  // namespace
