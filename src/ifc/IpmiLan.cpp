@@ -47,6 +47,22 @@ bool answered(const RespHolder& r, size_t dataBytes) { return r->cc == 0 && r->d
 
 const char* const kInstantiate = "IpmiIfcLanInstantiate";
 
+// Reads one parameter into `r` and returns its data, at least `dataBytes`
+// long, or null after logging the missing answer (`missing`) or the failure.
+const uint8_t* readParameter(RespHolder& r, uint8_t channel, uint8_t parameter, size_t dataBytes, const char* name,
+                             const char* missing) {
+    r.reset(getLanParameter(channel, parameter));
+    if (!r) {
+        ipmiLog(LOG_DEBUG, "%s: %s", kInstantiate, missing);
+        return nullptr;
+    }
+    if (!answered(r, dataBytes)) {
+        ipmiLog(LOG_ERR, "%s: Get %s failed: cc=0x%x", kInstantiate, name, r->cc);
+        return nullptr;
+    }
+    return r->data + kParameterData;
+}
+
 }  // namespace
 
 int IpmiLan::findLanChannel() {
@@ -83,71 +99,36 @@ int IpmiLan::IpmiIfcLanInstantiate(int) {
     if (channel == 0) channel = findLanChannel();
     const uint8_t ch = static_cast<uint8_t>(channel);
 
-    {
-        RespHolder r(getLanParameter(ch, lanParam::ipAddress));
-        if (!r) {
-            ipmiLog(LOG_DEBUG, "%s: Get IP addr - NULL response", kInstantiate);
-            enabled = false;
-        } else if (!answered(r, 4)) {
-            ipmiLog(LOG_ERR, "%s: Get IP addr failed: cc=0x%x", kInstantiate, r->cc);
-            enabled = false;
-        } else {
-            ipv4Address = dotted(r->data + kParameterData);
-            ipmiLog(LOG_DEBUG, "%s: BMC IP Address %s", kInstantiate, ipv4Address.c_str());
-            enabled = true;
-        }
+    RespHolder r;
+    if (const uint8_t* d = readParameter(r, ch, lanParam::ipAddress, 4, "IP addr", "Get IP addr - NULL response")) {
+        ipv4Address = dotted(d);
+        ipmiLog(LOG_DEBUG, "%s: BMC IP Address %s", kInstantiate, ipv4Address.c_str());
+        enabled = true;
+    } else {
+        enabled = false;
     }
-    {
-        RespHolder r(getLanParameter(ch, lanParam::ipAddressSource));
-        if (!r) {
-            ipmiLog(LOG_DEBUG, "%s: Get IP addr Source- NULL response", kInstantiate);
-        } else if (!answered(r, 1)) {
-            ipmiLog(LOG_ERR, "%s: Get IP addr Source failed: cc=0x%x", kInstantiate, r->cc);
-        } else {
-            addressOrigin = r->data[kParameterData];
-        }
+    // The missing blank before the dash is how log readers know this line.
+    if (const uint8_t* d =
+            readParameter(r, ch, lanParam::ipAddressSource, 1, "IP addr Source", "Get IP addr Source- NULL response"))
+        addressOrigin = d[0];
+    if (const uint8_t* d =
+            readParameter(r, ch, lanParam::macAddress, 6, "MAC address", "Get MAC address - NULL response")) {
+        char text[18];
+        snprintf(text, sizeof text, "%02x:%02x:%02x:%02x:%02x:%02x", d[0], d[1], d[2], d[3], d[4], d[5]);
+        macAddress = text;
+        ipmiLog(LOG_DEBUG, "%s: BMC MAC address %s", kInstantiate, macAddress.c_str());
     }
-    {
-        RespHolder r(getLanParameter(ch, lanParam::macAddress));
-        if (!r) {
-            ipmiLog(LOG_DEBUG, "%s: Get MAC address - NULL response", kInstantiate);
-        } else if (!answered(r, 6)) {
-            ipmiLog(LOG_ERR, "%s: Get MAC address failed: cc=0x%x", kInstantiate, r->cc);
-        } else {
-            const uint8_t* m = r->data + kParameterData;
-            char text[18];
-            snprintf(text, sizeof text, "%02x:%02x:%02x:%02x:%02x:%02x", m[0], m[1], m[2], m[3], m[4], m[5]);
-            macAddress = text;
-            ipmiLog(LOG_DEBUG, "%s: BMC MAC address %s", kInstantiate, macAddress.c_str());
-        }
-    }
-    {
-        RespHolder r(getLanParameter(ch, lanParam::subnetMask));
-        if (!r) {
-            ipmiLog(LOG_DEBUG, "%s: Get netmask - NULL response", kInstantiate);
-            return -1;
-        }
-        if (!answered(r, 4)) {
-            ipmiLog(LOG_ERR, "%s: Get netmask failed: cc=0x%x", kInstantiate, r->cc);
-            return -1;
-        }
-        ipv4Netmask = dotted(r->data + kParameterData);
-        ipmiLog(LOG_DEBUG, "%s: BMC Netmask %s", kInstantiate, ipv4Netmask.c_str());
-    }
-    {
-        RespHolder r(getLanParameter(ch, lanParam::defaultGatewayAddress));
-        if (!r) {
-            ipmiLog(LOG_DEBUG, "%s: Get default gateway - NULL response", kInstantiate);
-            return -1;
-        }
-        if (!answered(r, 4)) {
-            ipmiLog(LOG_ERR, "%s: Get default gateway failed: cc=0x%x", kInstantiate, r->cc);
-            return -1;
-        }
-        ipv4DefaultGateway = dotted(r->data + kParameterData);
-        // Logged with the netmask's wording, as log readers know it.
-        ipmiLog(LOG_DEBUG, "%s: BMC Netmask %s", kInstantiate, ipv4DefaultGateway.c_str());
-    }
+    // A netmask or gateway that cannot be read ends the refresh.
+    const uint8_t* d = readParameter(r, ch, lanParam::subnetMask, 4, "netmask", "Get netmask - NULL response");
+    if (!d) return -1;
+    ipv4Netmask = dotted(d);
+    ipmiLog(LOG_DEBUG, "%s: BMC Netmask %s", kInstantiate, ipv4Netmask.c_str());
+    d = readParameter(r, ch, lanParam::defaultGatewayAddress, 4, "default gateway",
+                      "Get default gateway - NULL response");
+    if (!d) return -1;
+    ipv4DefaultGateway = dotted(d);
+    // Logged with the netmask's wording, as log readers know it.
+    ipmiLog(LOG_DEBUG, "%s: BMC Netmask %s", kInstantiate, ipv4DefaultGateway.c_str());
     loadV6AddressesLocked();
     return 0;
 }
@@ -181,8 +162,8 @@ void IpmiLan::loadV6AddressesLocked() {
     } else {
         const uint8_t* a = r->data + ipv6Byte::first;
         char text[ipv6Byte::count * 3];
-        snprintf(text, sizeof text, "%02x:%02x:%02x:%02x:%02x:%02x:%02x:%02x", a[0], a[1], a[2], a[3], a[4], a[5],
-                 a[6], a[7]);
+        snprintf(text, sizeof text, "%02x:%02x:%02x:%02x:%02x:%02x:%02x:%02x", a[0], a[1], a[2], a[3], a[4], a[5], a[6],
+                 a[7]);
         ipv6Addresses.push_back(text);
     }
     ipmiLog(LOG_DEBUG, "%s: loaded %zu ipv6 addresses", "load_v6_addresses", ipv6Addresses.size());
