@@ -11,6 +11,9 @@ command -v make >/dev/null || need+=(make)
 [ -f /usr/include/benchmark/benchmark.h ] || need+=(libbenchmark-dev)
 [ -f /usr/include/linux/ipmi.h ] || need+=(linux-libc-dev)
 command -v pkg-config >/dev/null || need+=(pkg-config)
+# libFuzzer targets: clang and its sanitizer/fuzzer runtime.
+command -v clang++ >/dev/null || need+=(clang)
+compgen -G "/usr/lib/llvm-*/lib/clang/*/lib/linux/libclang_rt.fuzzer-x86_64.a" >/dev/null || need+=(libclang-rt-14-dev)
 # Independent IPMI clients: they check the simulator and our decodings.
 command -v ipmitool >/dev/null || need+=(ipmitool)
 command -v ipmi-sensors >/dev/null || need+=(freeipmi-tools)

@@ -13,8 +13,10 @@ build() {
   cmake --build "$dir" -j"$jobs"
 }
 
+# Every option this script relies on is set here, so a build directory left by
+# another script (the demo builds no tests) cannot silently drop tests.
 echo "== plain build"
-build build
+build build -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=ON -DTAV_IPMI_BUILD_TOOL=ON -DTAV_IPMI_SANITIZE=
 ctest --test-dir build --output-on-failure -j"$jobs"
 
 echo "== benchmarks (short run)"
@@ -23,9 +25,14 @@ for b in build/bench/*-bench; do
 done
 
 echo "== AddressSanitizer + UndefinedBehaviorSanitizer"
-build build-asan -DTAV_IPMI_SANITIZE=address,undefined -DTAV_IPMI_BUILD_BENCH=OFF
+build build-asan -DTAV_IPMI_SANITIZE=address,undefined -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=OFF \
+  -DTAV_IPMI_BUILD_TOOL=ON
 ctest --test-dir build-asan --output-on-failure -j"$jobs"
 
 echo "== ThreadSanitizer"
-build build-tsan -DTAV_IPMI_SANITIZE=thread -DTAV_IPMI_BUILD_BENCH=OFF
+build build-tsan -DTAV_IPMI_SANITIZE=thread -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=OFF \
+  -DTAV_IPMI_BUILD_TOOL=ON
 TSAN_OPTIONS="halt_on_error=1" ctest --test-dir build-tsan --output-on-failure -j"$jobs" -E 'PeerTools|Peer'
+
+echo "== fuzz targets (bounded run)"
+scripts/fuzz.sh "${TAV_IPMI_FUZZ_SECONDS:-20}"

@@ -263,7 +263,6 @@ int Simulator::sendCommand(DeviceHandle& h, void* arg) {
     }
 
     // Send and receive faults act in the driver, before the controller sees anything.
-    Fault fault;
     for (auto it = faults_.begin(); it != faults_.end(); ++it) {
         if (it->fault.kind != FaultKind::SendError) continue;
         bool matches = (it->netfn == kAnyCommand || (it->netfn & 0xFE) == (r.netfn & 0xFE)) &&

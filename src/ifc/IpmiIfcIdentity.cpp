@@ -44,7 +44,7 @@ constexpr size_t firstString = 5;   // block 0: string bytes from here
 // Blocks 1..: taken from the set selector on, so each later block puts its
 // selector byte (shown as a space) in front of its 16 string bytes. Hosts
 // that read the name back know it in this form.
-constexpr size_t laterString = 2;
+constexpr size_t laterString = setSelector;
 }  // namespace sysInfoByte
 
 constexpr size_t kSetBlockBytes = 18;        // parameter, set selector, 16 data bytes

@@ -18,7 +18,6 @@ namespace Ipmi {
 
 namespace {
 
-constexpr unsigned int kOwnAddress = 0x20;
 constexpr int kAnswerWaitMs = 30000;
 constexpr uint32_t kEmptyReceiveMarker = 0xDEADBEEF;
 
