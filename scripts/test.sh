@@ -19,6 +19,9 @@ echo "== plain build"
 build build -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=ON -DTAV_IPMI_BUILD_TOOL=ON -DTAV_IPMI_SANITIZE=
 ctest --test-dir build --output-on-failure -j"$jobs"
 
+echo "== install"
+scripts/install-test.sh build
+
 echo "== benchmarks (short run)"
 for b in build/bench/*-bench; do
   [ -x "$b" ] && "$b" --benchmark_min_time=0.01

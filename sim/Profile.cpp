@@ -15,6 +15,9 @@
 // word that is not a command, a missing argument or a bad number fails the
 // load with "file:line: message", as ipmi_sim stops at the first bad line.
 
+#include <dlfcn.h>
+#include <unistd.h>
+
 #include <algorithm>
 #include <cctype>
 #include <fstream>
@@ -566,7 +569,20 @@ std::string defaultProfilePath() {
 #ifdef TAV_IPMI_SIM_PROFILE_DIR
     return std::string(TAV_IPMI_SIM_PROFILE_DIR) + "/default.emu";
 #else
-    return "sim/profiles/default.emu";
+    // The preload library: its profiles lie beside it in the build tree and
+    // under the data directory once installed, so no build path is kept in it.
+    Dl_info self;
+    if (dladdr(reinterpret_cast<void*>(&defaultProfilePath), &self) == 0 || self.dli_fname == nullptr)
+        return "default.emu";
+    std::string dir = self.dli_fname;
+    dir = dir.substr(0, dir.rfind('/') + 1);
+    const std::string besideLibrary = dir + "profiles/default.emu";
+    if (access(besideLibrary.c_str(), R_OK) == 0) return besideLibrary;
+#ifdef TAV_IPMI_SIM_PROFILES_FROM_LIB
+    return dir + TAV_IPMI_SIM_PROFILES_FROM_LIB + "/default.emu";
+#else
+    return besideLibrary;
+#endif
 #endif
 }
 

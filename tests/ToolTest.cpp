@@ -4,6 +4,9 @@
 
 #include <gtest/gtest.h>
 
+#include <fstream>
+#include <sstream>
+
 #include "PeerTools.h"
 
 #ifdef TAV_IPMI_TOOL
@@ -36,6 +39,21 @@ TEST(Tool, AnUnknownViewIsRefusedWithTheUsage) {
     ToolRun run = tavipmi({"bogus"});
     EXPECT_EQ(run.exitCode, 2);
     EXPECT_EQ(run.err.rfind("tavipmi: unknown view 'bogus'\nusage: tavipmi", 0), 0u) << run.err;
+}
+
+// Every view and option that --help lists is described in the manual page.
+TEST(Tool, TheManualPageListsWhatHelpLists) {
+    ToolRun help = tavipmi({"--help"});
+    ASSERT_EQ(help.exitCode, 0);
+    std::ifstream in(std::string(TAV_IPMI_SOURCE_DIR) + "/tools/tavipmi.1");
+    const std::string page((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+    std::istringstream lines(help.out.substr(help.out.find("views:\n") + 7));
+    for (std::string line; std::getline(lines, line);) {
+        const std::string view = line.substr(2, line.find(' ', 2) - 2);
+        EXPECT_NE(page.find("\n.B " + view + "\n"), std::string::npos) << view;
+    }
+    for (const char* option : {"simulate", "help", "version"})
+        EXPECT_NE(page.find("\\-\\-" + std::string(option)), std::string::npos) << option;
 }
 
 }  // namespace

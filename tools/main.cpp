@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <initializer_list>
 #include <map>
 #include <string>
 #include <vector>
@@ -28,32 +29,54 @@ namespace {
 void usage(FILE* out) {
     fprintf(out,
             "usage: tavipmi [--simulate[=PROFILE]] [VIEW [ARGS...]]\n"
+            "       tavipmi --help | --version\n"
             "  --simulate[=PROFILE]  talk to the simulated BMC (default profile, or an ipmi_sim .emu file)\n"
             "views:\n");
     for (const auto& v : Tool::views()) fprintf(out, "  %-10s %s\n", v.first.c_str(), v.second.help.c_str());
 }
 
+// The running tool's own file, or "" when the system does not say.
+std::string ownPath() {
+    char self[PATH_MAX];
+    ssize_t n = readlink("/proc/self/exe", self, sizeof self - 1);
+    if (n <= 0) return "";
+    self[n] = '\0';
+    return self;
+}
+
+// The directory the running tool lies in, with a trailing slash.
+std::string ownDirectory() {
+    std::string path = ownPath();
+    return path.empty() ? "./" : path.substr(0, path.rfind('/') + 1);
+}
+
+// The first of the places (relative to the tool) that holds a readable file.
+std::string findBesideTool(std::initializer_list<const char*> relatives) {
+    const std::string dir = ownDirectory();
+    for (const char* r : relatives)
+        if (access((dir + r).c_str(), R_OK) == 0) return dir + r;
+    return "";
+}
+
 // Simulation is chosen at run time: the tool runs itself again with the
 // simulator's preload library, so the binary never carries the interposer.
 int reexecSimulated(char** argv, const std::string& profile) {
-#ifdef TAV_IPMI_SIM_PRELOAD
+#ifdef TAV_IPMI_PRELOAD_FROM_BIN
     const char* preload = getenv("TAVIPMI_SIM_PRELOAD");
-    std::string lib = preload ? preload : TAV_IPMI_SIM_PRELOAD;
-    if (access(lib.c_str(), R_OK) != 0) {
-        fprintf(stderr, "tavipmi: simulator library %s not found\n", lib.c_str());
+    std::string lib = preload ? preload : findBesideTool({TAV_IPMI_PRELOAD_FROM_BIN, "../sim/libtav-ipmi-sim-preload.so"});
+    if (lib.empty() || access(lib.c_str(), R_OK) != 0) {
+        fprintf(stderr, "tavipmi: simulator library libtav-ipmi-sim-preload.so not found\n");
         return 2;
     }
     setenv("LD_PRELOAD", lib.c_str(), 1);
     setenv("TAV_IPMI_SIM_PROFILE", profile.c_str(), 1);
     setenv("TAVIPMI_SIMULATED", "1", 1);
-    char self[PATH_MAX];
-    ssize_t n = readlink("/proc/self/exe", self, sizeof self - 1);
-    if (n <= 0) {
+    const std::string self = ownPath();
+    if (self.empty()) {
         perror("tavipmi: readlink");
         return 2;
     }
-    self[n] = '\0';
-    execv(self, argv);
+    execv(self.c_str(), argv);
     perror("tavipmi: execv");
     return 2;
 #else
@@ -64,13 +87,12 @@ int reexecSimulated(char** argv, const std::string& profile) {
 #endif
 }
 
-// The rules normally live in /etc; a tool run from its build tree, before
-// installation, uses the copy in the source tree.
+// The rules normally live in /etc. A tool installed under another prefix, or
+// run from its build tree, uses the copy that came with it.
 void loadHealthRules() {
-#ifdef TAV_IPMI_SOURCE_HEALTH_FILE
-    if (access("/etc/sfcb/tav/sensor_health", R_OK) != 0 && access(TAV_IPMI_SOURCE_HEALTH_FILE, R_OK) == 0)
-        Ipmi::LoadSensorHealthDataFile(TAV_IPMI_SOURCE_HEALTH_FILE);
-#endif
+    if (access("/etc/sfcb/tav/sensor_health", R_OK) == 0) return;
+    std::string rules = findBesideTool({TAV_IPMI_RULES_FROM_BIN, "../etc/sfcb/tav/sensor_health"});
+    if (!rules.empty()) Ipmi::LoadSensorHealthDataFile(rules.c_str());
 }
 
 }  // namespace
@@ -87,6 +109,9 @@ int main(int argc, char** argv) {
         } else if (a.rfind("--simulate=", 0) == 0) {
             simulate = true;
             profile = a.substr(strlen("--simulate="));
+        } else if (a == "--version") {
+            printf("tavipmi (tav-ipmi) %s\n", TAV_IPMI_VERSION);
+            return 0;
         } else if (a == "-h" || a == "--help") {
             usage(stdout);
             return 0;
