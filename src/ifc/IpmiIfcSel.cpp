@@ -440,7 +440,8 @@ uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
         firstAnswer = stored.version == 0 && oldAdd == 0 && oldErase == 0;
         last = n.work.sel.last_record_id;
     }
-    if (!cli && oldAdd == newAdd && oldErase == newErase) return 0;
+    // The first answer is stored even when a never-used log reports no stamps.
+    if (!cli && !firstAnswer && oldAdd == newAdd && oldErase == newErase) return 0;
     const uint32_t since = oldAdd != 0 ? oldAdd : newAdd;
 
     if (!cli && oldErase == newErase) {
