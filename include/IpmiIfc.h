@@ -193,6 +193,9 @@ TAV_IPMI_API void IpmiIfcOpenIpmiClose(int node);
 // Reads the SDR repository when it changed and rebuilds sensors and entities
 // from it (the polling loop does this by itself; one-shot tools call it).
 TAV_IPMI_API uint32_t IpmiIfcSdrGetInfo(int node);
+// Asks for the SEL info and follows a change: reads new records or reloads
+// the log (one-shot tools call it to load the SEL). `count` may be null.
+TAV_IPMI_API uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count);
 
 }  // namespace Ipmi
 

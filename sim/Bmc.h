@@ -86,6 +86,10 @@ uint32_t selClock(const Bmc& bmc);
 uint16_t addSelRecord(Bmc& bmc, const uint8_t record[16], bool keepTimestamp = false);
 // Empties the log and stamps the erase time.
 void clearSelRecords(Bmc& bmc);
+// Appends the records of a SEL file (16-byte records back to back) as they
+// are, IDs and time stamps included.
+// Throws std::runtime_error("file: message") when it cannot be read or is cut short.
+void loadSelDump(Bmc& bmc, const std::string& path);
 
 // Builds a controller from an ipmi_sim emulator command file.
 // Throws std::runtime_error("file:line: message") on a syntax error.

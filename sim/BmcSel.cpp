@@ -5,6 +5,9 @@
 #include <time.h>
 
 #include <algorithm>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
 
 #include "Bmc.h"
 #include "IpmiCommands.h"
@@ -243,6 +246,23 @@ void clearSelRecords(Bmc& bmc) {
         const uint8_t cleared[16] = {0, 0, 0x02, 0, 0, 0, 0, 0x20, 0x00, 0x04, kEventLoggingDisabled, 0x01, 0x6F,
                                      kLogAreaCleared, 0xFF, 0xFF};
         addSelRecord(bmc, cleared);
+    }
+}
+
+void loadSelDump(Bmc& bmc, const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    if (!in) throw std::runtime_error(path + ": cannot be read");
+    std::vector<uint8_t> bytes((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+    if (bytes.size() % kRecordBytes != 0) throw std::runtime_error(path + ": not whole 16-byte records");
+    SelModel& sel = bmc.sel;
+    for (size_t at = 0; at < bytes.size(); at += kRecordBytes) {
+        std::vector<uint8_t> record(bytes.begin() + static_cast<long>(at),
+                                    bytes.begin() + static_cast<long>(at + kRecordBytes));
+        const uint16_t id = idOf(record);
+        if (id >= sel.nextRecordId && id < sel::lastRecord - 1) sel.nextRecordId = static_cast<uint16_t>(id + 1);
+        if (record[kRecordTypeAt] <= kTimestampedLast)
+            sel.additionTimestamp = std::max(sel.additionTimestamp, sel::le32(record.data() + kTimestampAt));
+        sel.records.push_back(std::move(record));
     }
 }
 

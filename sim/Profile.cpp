@@ -568,6 +568,10 @@ std::shared_ptr<Bmc> loadProfile(const std::string& path) {
         loadSdrDump(*bmc, path);
         return bmc;
     }
+    if (endsWith(path, ".sel")) {  // a controller whose SEL holds these records
+        loadSelDump(*bmc, path);
+        return bmc;
+    }
     // A profile has a SEL only if it enables one.
     bmc->sel.enabled = false;
     ProfileReader reader(*bmc);
