@@ -418,6 +418,7 @@ uint32_t IpmiIfcSelGetAll(int node) {
 // a record logged in the same second as the previous pass, or after the
 // controller's clock went back, still arrives once, and none arrives twice.
 // The log found by the first answer is loaded without delivering anything.
+// An unchanged answer (stamps and entry count) touches nothing.
 uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
     if (resp == nullptr || resp->cc != 0 || resp->data_len < sel::info::size) return kSelFailed;
     if (count) *count = resp->data[sel::info::entries];
@@ -430,26 +431,34 @@ uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
     const uint32_t newErase = sel::le32(resp->data + sel::info::eraseTimestamp);
     const uint16_t newCount = sel::le16(resp->data + sel::info::entries);
     uint32_t oldAdd, oldErase;
+    uint16_t oldCount, last;
     bool firstAnswer;
-    uint16_t last;
     {
         TAV::MutexLock guard(n.selMutex);
         const ipmiifc_sel_info stored = headerOf(n);
         oldAdd = stored.addition_timestamp;
         oldErase = stored.erase_timestamp;
+        oldCount = stored.entries;
         firstAnswer = stored.version == 0 && oldAdd == 0 && oldErase == 0;
         last = n.work.sel.last_record_id;
     }
-    // The first answer is stored even when a never-used log reports no stamps.
-    if (!cli && !firstAnswer && oldAdd == newAdd && oldErase == newErase) return 0;
+    // Stamps count whole seconds: a record logged in the same second as the
+    // last answer leaves them as they were, but not the entry count. The
+    // first answer is stored even when a never-used log reports no stamps.
+    if (!cli && !firstAnswer && oldAdd == newAdd && oldErase == newErase && oldCount == newCount) return 0;
     const uint32_t since = oldAdd != 0 ? oldAdd : newAdd;
 
     if (!cli && oldErase == newErase) {
+        std::vector<std::shared_ptr<IpmiSelData>> stale;  // from before a restart; released outside the lock
         {
             TAV::MutexLock guard(n.selMutex);
             f.deliverNew = !firstAnswer;
-            if (firstAnswer) f.pending.clear();
+            if (firstAnswer) {
+                f.pending.clear();
+                stale.swap(n.selRecords);
+            }
         }
+        stale.clear();
         IpmiIfcSelReserve(node);
         readNew(node, last, static_cast<uint32_t>(newCount) + 1);
         {
