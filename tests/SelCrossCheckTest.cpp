@@ -106,7 +106,7 @@ std::vector<Row> freeIpmiRows(const std::string& out) {
     return rows;
 }
 
-class SelCrossCheck : public ::testing::TestWithParam<std::string> {
+class SelPeerCrossCheck : public ::testing::TestWithParam<std::string> {
 protected:
     void SetUp() override {
         SKIP_WITHOUT_TOOL("ipmitool");
@@ -117,7 +117,7 @@ protected:
 
 // Records with a standard event type carry type and text in all three; OEM
 // records only their ID and time (and FreeIPMI its sensor number).
-TEST_P(SelCrossCheck, AllToolsListTheSameRecords) {
+TEST_P(SelPeerCrossCheck, AllToolsListTheSameRecords) {
     ToolRun mine = runTool(GetParam(), TAV_IPMI_TOOL, {"sel"});
     ToolRun elist = runTool(GetParam(), toolPath("ipmitool"), {"-I", "open", "sel", "elist"});
     ToolRun fi = runTool(GetParam(), toolPath("ipmi-sel"), {"--driver-type=OPENIPMI", "--ignore-sdr-cache"});
@@ -151,7 +151,7 @@ std::vector<std::string> selProfiles() {
     return all;
 }
 
-INSTANTIATE_TEST_SUITE_P(Sel, SelCrossCheck, ::testing::ValuesIn(selProfiles()),
+INSTANTIATE_TEST_SUITE_P(Sel, SelPeerCrossCheck, ::testing::ValuesIn(selProfiles()),
                          [](const ::testing::TestParamInfo<std::string>& p) {
                              std::string name = p.param.substr(p.param.rfind('/') + 1);
                              std::replace_if(name.begin(), name.end(), [](char c) { return !isalnum(c); }, '_');
