@@ -10,6 +10,7 @@
 
 #include <algorithm>
 #include <array>
+#include <atomic>
 #include <deque>
 #include <mutex>
 #include <vector>
@@ -375,7 +376,7 @@ uint32_t IpmiIfcSelReadNew(int node, uint16_t last) {
 
 uint32_t IpmiIfcSelGetAll(int node) {
     // Logged once per process, whatever the node.
-    static bool _invalid_version_logged = false;
+    static std::atomic<bool> _invalid_version_logged{false};
     IpmiNode& n = slot(node);
     uint8_t version;
     {
@@ -394,8 +395,7 @@ uint32_t IpmiIfcSelGetAll(int node) {
     }
     if (reservation == 0) IpmiIfcSelReserve(node);
     if (version != sel::supportedVersion && (version & 0x0F) < kRecordIdVersionNibbleMin) {
-        if (!_invalid_version_logged) {
-            _invalid_version_logged = true;
+        if (!_invalid_version_logged.exchange(true)) {
             ipmiLog(LOG_ERR, "IpmiIfcSelGetAll: invalid version. Version = 0x%x", version);
         }
         return kSelFailed;
