@@ -16,6 +16,8 @@ namespace Ipmi {
 
 class IpmiLan;
 class IpmiSensor;
+class IpmiSel;
+class IpmiSelData;
 
 // What a wake-up of the polling loop asks for.
 enum IPMI_POLL_TYPE {
@@ -49,6 +51,27 @@ struct ipmiifc_sdr_info {
     uint32_t addition_timestamp;
     uint32_t erase_timestamp;
     uint8_t operation_support;
+} __attribute__((packed));
+
+// The stored Get SEL Info answer, completion code first.
+struct ipmiifc_sel_info {
+    uint8_t cc;
+    uint8_t version;             // 0x51 for IPMI 1.5 and 2.0
+    uint16_t entries;
+    uint16_t free_space;         // bytes
+    uint32_t addition_timestamp;
+    uint32_t erase_timestamp;
+    uint8_t operation_support;   // bit 7: overflow
+} __attribute__((packed));
+
+// The stored Get SEL Allocation Info answer, completion code first.
+struct ipmiifc_sel_alloc_info {
+    uint8_t cc;
+    uint16_t units;
+    uint16_t unit_size;  // bytes; 0 when the controller does not say
+    uint16_t free_units;
+    uint16_t largest_free_block;
+    uint8_t max_record_units;
 } __attribute__((packed));
 
 // Public entry points; every per-node operation has an overload for node 0.
@@ -129,6 +152,34 @@ public:
     static int unRegisterSelEventHandler(IpmiSelEventHandler handler);
     static bool generatesMemoryEvents(int node);
 
+    // System event log. Results of clearSel.
+    enum SEL_CLEAR_RESULT {
+        SEL_CLEAR_OK = 0,
+        SEL_CLEAR_NOT_CONFIRMED = 2,  // busy five times, or an unexpected erasure status
+        SEL_CLEAR_NO_ANSWER = 4,
+        SEL_CLEAR_REFUSED = 5         // another completion code (logged)
+    };
+    // The summary built from the last Get SEL Info answer; empty before one.
+    static std::shared_ptr<IpmiSel> getSel(int node);
+    static std::shared_ptr<IpmiSel> getSel();
+    // The records read so far, oldest first.
+    static std::vector<std::shared_ptr<IpmiSelData>> getSelData(int node);
+    static std::vector<std::shared_ptr<IpmiSelData>> getSelData();
+    static ipmiifc_sel_info getRawSelHeader(int node);
+    static ipmiifc_sel_info getRawSelHeader();
+    // Erases the controller's SEL; one of SEL_CLEAR_RESULT.
+    static int clearSel(int node);
+    static int clearSel();
+    // The record ID software last processed (PEF); 0 when unknown.
+    static uint16_t getLastProcessedSELEntry(int node);
+    static uint16_t getLastProcessedSELEntry();
+    static void setLastProcessedSELEntry(int node, uint16_t id);
+    static void setLastProcessedSELEntry(uint16_t id);
+    // The controller's SEL clock in seconds, 0 when it cannot be read. Uses a
+    // descriptor of its own, so it works with or without the polling loop.
+    static uint32_t GetSelClock();
+    static uint32_t selGetClock(int node);
+
     // LAN configuration.
     static IpmiLan* getLan(int node);
     static IpmiLan* getLan();
@@ -142,6 +193,9 @@ TAV_IPMI_API void IpmiIfcOpenIpmiClose(int node);
 // Reads the SDR repository when it changed and rebuilds sensors and entities
 // from it (the polling loop does this by itself; one-shot tools call it).
 TAV_IPMI_API uint32_t IpmiIfcSdrGetInfo(int node);
+// Asks for the SEL info and follows a change: reads new records or reloads
+// the log (one-shot tools call it to load the SEL). `count` may be null.
+TAV_IPMI_API uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count);
 
 }  // namespace Ipmi
 

@@ -14,6 +14,15 @@
 // Tells the interposer that it lives in the preload library.
 extern "C" const int tavIpmiSimPreloaded = 1;
 
+// Lets a program running on the simulator (the tool's watch demo) log a SEL
+// record as the controller's own sensors would. Returns the record ID, 0 when
+// the log is full or no controller is installed.
+extern "C" __attribute__((visibility("default"))) int tavIpmiSimAddSelEvent(const unsigned char* record) {
+    int id = 0;
+    Sim::Simulator::instance().withBmc([&](Sim::Bmc& b) { id = Sim::addSelRecord(b, record); });
+    return id;
+}
+
 namespace {
 
 __attribute__((constructor)) void installFromEnvironment() {

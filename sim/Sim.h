@@ -7,6 +7,7 @@
 #include <stdint.h>
 
 #include <atomic>
+#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -129,6 +130,9 @@ public:
     bool installed() const;
     std::shared_ptr<Bmc> bmc() const;
     VirtualClock& clock() { return clock_; }
+    // Runs `change` on the controller under the lock that answers take, so
+    // another thread may change the model while the library talks to it.
+    void withBmc(const std::function<void(Bmc&)>& change);
 
     // Faults, in front of the controller's command table.
     void addFault(int netfn, int cmd, const Fault& fault);

@@ -26,10 +26,16 @@ TEST(Tool, ViewsShowTheSimulatedServer) {
         {"lan", {"  IP address         : 192.168.1.10", "  MAC address        : 00:14:22:0a:1b:2c"}},
         {"sensors", {"  PS1 Input Power  | Other                    | 232 Watts                | ok      | OK"}},
         {"entities", {"  System Chassis (23.1)", "    Power Supply (10.2)"}},
+        {"sel", {"  0006 | 2025-11-25 12:33:18 | DIMM A 3 #0x62       | Assert + Memory Correctable ECC                  | -"
+                 "        | Correctable ECC"}},
+        {"watch", {"Watching the system event log (Ctrl-C ends)",
+                   " | Inlet Temp #0x01     | Deassert + Temperature Upper Non-critical going high | major    | Upper "
+                   "Non-critical going high"}},
     };
     for (const auto& v : views) {
         SCOPED_TRACE(v.view);
-        ToolRun run = tavipmi({v.view});
+        // The watch ends after two records that its demo logs on the simulator.
+        ToolRun run = v.view == std::string("watch") ? tavipmi({"watch", "--demo", "--count", "2"}) : tavipmi({v.view});
         EXPECT_EQ(run.exitCode, 0) << run.err;
         for (const auto& line : v.lines) EXPECT_NE(run.out.find(line + "\n"), std::string::npos) << run.out;
     }
