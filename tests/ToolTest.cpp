@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include "PeerTools.h"
+#include "TestSupport.h"
 
 #ifdef TAV_IPMI_TOOL
 
@@ -23,6 +24,7 @@ TEST(Tool, ViewsShowTheSimulatedServer) {
         {"lan", {"  IP address         : 192.168.1.10", "  MAC address        : 00:14:22:0a:1b:2c"}},
         {"sensors", {"  PS1 Input Power  | Other                    | 232 Watts                | ok      | OK"}},
         {"entities", {"  System Chassis (23.1)", "    Power Supply (10.2)"}},
+        {"fru", {"  FRU 1 PS1 (Power Supply 10.1)", "    PSU capacity (W)       550"}},
     };
     for (const auto& v : views) {
         SCOPED_TRACE(v.view);
@@ -30,6 +32,16 @@ TEST(Tool, ViewsShowTheSimulatedServer) {
         EXPECT_EQ(run.exitCode, 0) << run.err;
         for (const auto& line : v.lines) EXPECT_NE(run.out.find(line + "\n"), std::string::npos) << run.out;
     }
+}
+
+TEST(Tool, AFruImageFileIsServedAsDeviceZero) {
+    const std::string image = TestSupport::realDataPath("fru/infrasim_s2600wtt_fru2.bin");
+    if (image.empty()) GTEST_SKIP() << "real server data not present";
+    ToolRun run = TestSupport::runTool(image, TAV_IPMI_TOOL, {"fru"});
+    EXPECT_EQ(run.exitCode, 0) << run.err;
+    EXPECT_NE(run.out.find("  FRU 0 System Board (System Board 7.1)\n    Product manufacturer   DELTA\n"),
+              std::string::npos)
+        << run.out;
 }
 
 TEST(Tool, AnUnknownViewIsRefusedWithTheUsage) {
