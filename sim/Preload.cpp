@@ -1,13 +1,17 @@
 // LD_PRELOAD entry: other programs (ipmitool, FreeIPMI) see the simulated
 // controller named by TAV_IPMI_SIM_PROFILE ("default" for the project's own).
 // A raw FRU image (a name ending in ".bin") is served as FRU device 0 of
-// the default controller. TAV_IPMI_SIM_VIRTUAL_TIME=1 makes their sleeps and time-outs virtual.
+// the default controller. TAV_IPMI_SIM_COUNTS=FILE writes, at exit, how many
+// requests of each command the controller answered ("netfn cmd count" lines,
+// hexadecimal netfn and cmd). TAV_IPMI_SIM_VIRTUAL_TIME=1 makes their sleeps and time-outs virtual.
 
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 
 #include <exception>
+#include <map>
+#include <utility>
 
 #include "Bmc.h"
 #include "Sim.h"
@@ -31,6 +35,17 @@ __attribute__((constructor)) void installFromEnvironment() {
     } catch (const std::exception& e) {
         fprintf(stderr, "tav-ipmi simulator: %s\n", e.what());
     }
+}
+
+__attribute__((destructor)) void reportCounts() {
+    const char* path = getenv("TAV_IPMI_SIM_COUNTS");
+    if (path == nullptr || *path == '\0' || !Sim::Simulator::instance().installed()) return;
+    std::map<std::pair<int, int>, unsigned> counts;
+    for (const auto& r : Sim::Simulator::instance().requests()) ++counts[{r.netfn, r.cmd}];
+    FILE* out = fopen(path, "w");
+    if (out == nullptr) return;
+    for (const auto& c : counts) fprintf(out, "%02x %02x %u\n", c.first.first, c.first.second, c.second);
+    fclose(out);
 }
 
 }  // namespace

@@ -12,7 +12,7 @@ std::shared_ptr<const IpmiFruOptional> IpmiFru::getArea(AreaKind kind) const {
     return kind >= 0 && kind < FRU_AREA_COUNT ? areas_[kind] : nullptr;
 }
 
-// The discovery pass fills each slot with its own kind only.
+// A slot set with another kind of area reads as absent.
 std::shared_ptr<const IpmiFruChassis> IpmiFru::getChassis() const {
     return std::dynamic_pointer_cast<const IpmiFruChassis>(areas_[FRU_AREA_CHASSIS]);
 }
