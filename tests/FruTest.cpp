@@ -27,6 +27,7 @@ protected:
     void SetUp() override {
         SimTest::SetUp();
         fru_max_req_size = 23;
+        node().fruState = {};
         for (size_t i = 0; i < image.size(); ++i) image[i] = static_cast<uint8_t>(i * 7 + 1);
         bmc().fru.devices[1].data = image;
     }
@@ -116,6 +117,19 @@ TEST_F(Fru, ReadFruDataShrinksRetriesAndGivesUp) {
     }
 }
 
+TEST_F(Fru, AMultiRecordChainWithoutEndStopsAtTheInventoryEnd) {
+    // Seven 8-byte records from offset 8, none marked last, fill the device.
+    for (size_t at = 8; at < image.size(); at += 8) {
+        const Bytes record{0xC0, 0x02, 3, 0, static_cast<uint8_t>(0x100 - 0xC5), 1, 2, 3};
+        std::copy(record.begin(), record.end(), image.begin() + static_cast<long>(at));
+    }
+    bmc().fru.devices[1].data = image;
+    node().fruState.area_info[1] = 64;
+    EXPECT_EQ(IpmiIfcFruMultiLength(0, 1, 8), 56u);
+    EXPECT_EQ(sim().exchanges(st, cmd::readFruData), 7u);
+    EXPECT_TRUE(log.contains(LOG_INFO, "IpmiIfcFruMultiLength: no end of list before offset 0x40"));
+}
+
 TEST_F(Fru, WordAccessAsksForWords) {
     bmc().fru.devices[1].wordAccess = true;
     read(23, nullptr, 1);
@@ -180,6 +194,9 @@ TEST(FruArea, GettersFallBackToTheirDefaults) {
         EXPECT_EQ(IpmiFruChassis(16, chassis.data()).getType(), t.name) << int(t.type);
     }
     EXPECT_EQ(log.count("getType: return unknown, fru format not handled (area_ver = 0x2"), 1u);
+    c.dump();
+    EXPECT_TRUE(log.contains(LOG_DEBUG, "Chassis Info Area : 0x10\nData 0x00: 0x01 0x02 0x17 0xc2 0x41 0xc3 0xc3 0x53 "
+                                        "0x4e 0x31 0xc1 0x00 0x00 0x00 0x00 0x00"));
     // A field that claims more bytes than the area holds yields what is there.
     const Bytes cut{1, 1, 0, 0xFF, 'x', 'y'};
     EXPECT_EQ(IpmiFruProduct(6, cut.data()).getManufacturer(), "xy");
