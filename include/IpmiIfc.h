@@ -9,6 +9,7 @@
 
 #include "CmpiStatus.h"
 #include "IpmiEntity.h"
+#include "IpmiFru.h"
 #include "IpmiNode.h"
 #include "TavIpmiExport.h"
 
@@ -72,6 +73,15 @@ struct ipmiifc_sel_alloc_info {
     uint16_t free_units;
     uint16_t largest_free_block;
     uint8_t max_record_units;
+} __attribute__((packed));
+
+// The stored Get FRU Inventory Area Info answer, completion code first, and
+// the FRU device it was asked for.
+struct ipmiifc_fru_area_info {
+    uint8_t cc;
+    uint16_t size;  // inventory area size in bytes
+    uint8_t access;  // bit 0 set: the device is accessed by words
+    uint8_t device_id;
 } __attribute__((packed));
 
 // Public entry points; every per-node operation has an overload for node 0.
@@ -145,6 +155,18 @@ public:
     static IpmiEntity getEntityParent(int node, unsigned int id, unsigned int instance);
     static IpmiEntity getEntityParent(unsigned int id, unsigned int instance);
 
+    // FRU inventory, as the last discovery pass found it. The list is
+    // replaced whole, so a caller never sees a half-built one; the objects
+    // stay valid for as long as the caller holds them.
+    static std::vector<std::shared_ptr<IpmiFru>> getFrus(int node);
+    static std::vector<std::shared_ptr<IpmiFru>> getFrus();
+    // One area of one FRU device, or null when the device or the area is
+    // absent (or the area failed to read or to pass its checksum).
+    static std::shared_ptr<const IpmiFruOptional> getFruPart(int node, uint8_t deviceId, IpmiFru::AreaKind kind);
+    static std::shared_ptr<const IpmiFruOptional> getFruPart(uint8_t deviceId, IpmiFru::AreaKind kind);
+    // The last Get FRU Inventory Area Info answer of the node.
+    static ipmiifc_fru_area_info getFruDeviceHeader(int node);
+
     // SEL event handlers.
     static int registerSelEventHandler(int node, IpmiSelEventHandler handler, void* context);
     static int registerSelEventHandler(IpmiSelEventHandler handler, void* context);
@@ -196,6 +218,9 @@ TAV_IPMI_API uint32_t IpmiIfcSdrGetInfo(int node);
 // Asks for the SEL info and follows a change: reads new records or reloads
 // the log (one-shot tools call it to load the SEL). `count` may be null.
 TAV_IPMI_API uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count);
+// Reads every FRU device that the node's FRU device locator records name and
+// replaces the node's FRU list (the polling loop does this by itself).
+TAV_IPMI_API int IpmiIfcFruInstantiateAll(int node);
 
 }  // namespace Ipmi
 

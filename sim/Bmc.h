@@ -100,6 +100,9 @@ std::string defaultProfilePath();
 // back, 5-byte header + body) to the controller's SDR repository.
 // Throws std::runtime_error("file: message") when it cannot be read or is cut short.
 void loadSdrDump(Bmc& bmc, const std::string& path);
+// Serves a raw FRU image file (offset 0 = common header) as FRU device `deviceId`.
+// Throws std::runtime_error("file: message") when it cannot be read.
+void loadFruImage(Bmc& bmc, uint8_t deviceId, const std::string& path);
 
 }  // namespace Sim
 

@@ -109,6 +109,9 @@ struct LanModel {
 
 struct FruDeviceModel {
     std::vector<uint8_t> data;
+    bool wordAccess = false;  // offsets and counts in 16-bit words
+    // Largest count in bytes one Read FRU Data answers; asking more gives 0xCA.
+    uint8_t maxReadBytes = 32;
 };
 
 struct FruModel {

@@ -1,12 +1,17 @@
 // LD_PRELOAD entry: other programs (ipmitool, FreeIPMI) see the simulated
 // controller named by TAV_IPMI_SIM_PROFILE ("default" for the project's own).
-// TAV_IPMI_SIM_VIRTUAL_TIME=1 makes their sleeps and time-outs virtual.
+// A raw FRU image (a name ending in ".bin") is served as FRU device 0 of
+// the default controller. TAV_IPMI_SIM_COUNTS=FILE writes, at exit, how many
+// requests of each command the controller answered ("netfn cmd count" lines,
+// hexadecimal netfn and cmd). TAV_IPMI_SIM_VIRTUAL_TIME=1 makes their sleeps and time-outs virtual.
 
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 
 #include <exception>
+#include <map>
+#include <utility>
 
 #include "Bmc.h"
 #include "Sim.h"
@@ -28,13 +33,28 @@ namespace {
 __attribute__((constructor)) void installFromEnvironment() {
     const char* profile = getenv("TAV_IPMI_SIM_PROFILE");
     if (profile == nullptr || *profile == '\0') return;
-    std::string path = strcmp(profile, "default") == 0 ? Sim::defaultProfilePath() : std::string(profile);
+    const std::string name(profile);
+    const bool fruImage = name.size() > 4 && name.compare(name.size() - 4, 4, ".bin") == 0;
+    std::string path = name == "default" || fruImage ? Sim::defaultProfilePath() : name;
     try {
         const char* vt = getenv("TAV_IPMI_SIM_VIRTUAL_TIME");
-        Sim::Simulator::instance().install(Sim::loadProfile(path), vt != nullptr && strcmp(vt, "1") == 0);
+        auto bmc = Sim::loadProfile(path);
+        if (fruImage) Sim::loadFruImage(*bmc, 0, name);
+        Sim::Simulator::instance().install(bmc, vt != nullptr && strcmp(vt, "1") == 0);
     } catch (const std::exception& e) {
         fprintf(stderr, "tav-ipmi simulator: %s\n", e.what());
     }
+}
+
+__attribute__((destructor)) void reportCounts() {
+    const char* path = getenv("TAV_IPMI_SIM_COUNTS");
+    if (path == nullptr || *path == '\0' || !Sim::Simulator::instance().installed()) return;
+    std::map<std::pair<int, int>, unsigned> counts;
+    for (const auto& r : Sim::Simulator::instance().requests()) ++counts[{r.netfn, r.cmd}];
+    FILE* out = fopen(path, "w");
+    if (out == nullptr) return;
+    for (const auto& c : counts) fprintf(out, "%02x %02x %u\n", c.first.first, c.first.second, c.second);
+    fclose(out);
 }
 
 }  // namespace

@@ -8,6 +8,7 @@
 #include <sstream>
 
 #include "PeerTools.h"
+#include "TestSupport.h"
 
 #ifdef TAV_IPMI_TOOL
 
@@ -31,6 +32,7 @@ TEST(Tool, ViewsShowTheSimulatedServer) {
         {"watch", {"Watching the system event log (Ctrl-C ends)",
                    " | Inlet Temp #0x01     | Deassert + Temperature Upper Non-critical going high | major    | Upper "
                    "Non-critical going high"}},
+        {"fru", {"  FRU 1 PS1 (Power Supply 10.1)", "    PSU capacity (W)       550"}},
     };
     for (const auto& v : views) {
         SCOPED_TRACE(v.view);
@@ -39,6 +41,16 @@ TEST(Tool, ViewsShowTheSimulatedServer) {
         EXPECT_EQ(run.exitCode, 0) << run.err;
         for (const auto& line : v.lines) EXPECT_NE(run.out.find(line + "\n"), std::string::npos) << run.out;
     }
+}
+
+TEST(Tool, AFruImageFileIsServedAsDeviceZero) {
+    const std::string image = TestSupport::realDataPath("fru/infrasim_s2600wtt_fru2.bin");
+    if (image.empty()) GTEST_SKIP() << "real server data not present";
+    ToolRun run = TestSupport::runTool(image, TAV_IPMI_TOOL, {"fru"});
+    EXPECT_EQ(run.exitCode, 0) << run.err;
+    EXPECT_NE(run.out.find("  FRU 0 System Board (System Board 7.1)\n    Product manufacturer   DELTA\n"),
+              std::string::npos)
+        << run.out;
 }
 
 TEST(Tool, AnUnknownViewIsRefusedWithTheUsage) {

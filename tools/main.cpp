@@ -31,6 +31,7 @@ void usage(FILE* out) {
             "usage: tavipmi [--simulate[=PROFILE]] [VIEW [ARGS...]]\n"
             "       tavipmi --help | --version\n"
             "  --simulate[=PROFILE]  talk to the simulated BMC (default profile, or an ipmi_sim .emu file)\n"
+            "  --simulate=IMAGE.bin  the default simulated BMC serving a raw FRU image as FRU device 0\n"
             "views:\n");
     for (const auto& v : Tool::views()) fprintf(out, "  %-10s %s\n", v.first.c_str(), v.second.help.c_str());
 }
