@@ -11,7 +11,6 @@
 #include <algorithm>
 #include <array>
 #include <atomic>
-#include <deque>
 #include <mutex>
 #include <vector>
 
@@ -35,7 +34,6 @@ constexpr int kHandlerOk = 0;
 constexpr int kHandlerNotRegistered = 2;
 constexpr int kHandlerMissing = 5;
 
-using RecordBytes = std::array<uint8_t, sel::recordSize>;
 
 IpmiNode& slot(int node) { return g_IpmiNode[(node >= 0 && node < IPMI_NODE_COUNT) ? node : 0]; }
 int slotIndex(int node) { return (node >= 0 && node < IPMI_NODE_COUNT) ? node : 0; }
@@ -43,14 +41,10 @@ int slotIndex(int node) { return (node >= 0 && node < IPMI_NODE_COUNT) ? node : 
 // Sleeps a pseudo-random 0-3 seconds, as the retry rules want.
 void sleepTimeAnd3() { sleep(static_cast<unsigned>(time(nullptr) & 3)); }
 
-// Which records a pass may deliver. Guarded by the node's selMutex, except
-// `follow`, which makes the passes of one node run one at a time (a handler
-// that clears the SEL starts a nested pass on its own thread).
+// Makes the passes of one node run one at a time (a handler that clears the
+// SEL starts a nested pass on its own thread).
 struct SelFollow {
     std::recursive_mutex follow;
-    bool deliverNew = false;          // false while the log found at start loads
-    std::vector<RecordBytes> known;   // sorted: records held before a reload
-    std::deque<std::shared_ptr<IpmiSelData>> pending;  // new, not yet delivered
 };
 
 SelFollow& followOf(int node) {
@@ -143,25 +137,13 @@ private:
     TAV::Mutex& m_;
 };
 
-RecordBytes bytesOf(const sel_event_record& r) {
-    RecordBytes b;
-    memcpy(b.data(), &r, sel::recordSize);
-    return b;
-}
-
-// Puts one record read into the list; selMutex not held. A record counts as
-// new unless the log found at start is loading or it was already held
-// before a reload (same 16 bytes: same ID, time and event).
+// Puts one record read into the list; selMutex not held.
 void appendRecord(int node, ipmiifc_sel_entry& entry) {
     IpmiNode& n = slot(node);
-    SelFollow& f = followOf(node);
     auto record = std::make_shared<IpmiSelData>(&entry.record, 0);
     TAV::MutexLock guard(n.selMutex);
-    n.selRecords.push_back(record);
+    n.selRecords.push_back(std::move(record));
     n.work.sel.last_record_id = sel::le16(entry.record.record_id);
-    if (!f.deliverNew) return;
-    if (!f.known.empty() && std::binary_search(f.known.begin(), f.known.end(), bytesOf(entry.record))) return;
-    f.pending.push_back(std::move(record));
 }
 
 ipmiifc_sel_info headerOf(const IpmiNode& n) {
@@ -412,53 +394,43 @@ uint32_t IpmiIfcSelGetAll(int node) {
 // `count` gets only the low byte of the entry count: a log of 300 entries
 // reports 44. The polling loop compares counts from pass to pass and relies on this.
 //
-// Which records are new is decided while reading, not by time stamp: an
-// incremental pass appends only records logged after the last one held, and
-// a reload after an erase holds back the records that were there before. So
-// a record logged in the same second as the previous pass, or after the
-// controller's clock went back, still arrives once, and none arrives twice.
-// The log found by the first answer is loaded without delivering anything.
-// An unchanged answer (stamps and entry count) touches nothing.
+// New records are told by time: records stamped at or before the addition
+// stamp the pass started from (`since`) are not delivered. So the log found
+// by the first answer loads without reaching any handler (`since` is then
+// the controller's own stamp), and a record reaches the handlers once, in
+// the pass that reads it.
 uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
     if (resp == nullptr || resp->cc != 0 || resp->data_len < sel::info::size) return kSelFailed;
     if (count) *count = resp->data[sel::info::entries];
     const int node = resp->node;
     IpmiNode& n = slot(node);
-    SelFollow& f = followOf(node);
-    std::lock_guard<std::recursive_mutex> pass(f.follow);
+    std::lock_guard<std::recursive_mutex> pass(followOf(node).follow);
     const bool cli = _getState(0) == IpmiIfc::IPMI_STATE_CLI;
     const uint32_t newAdd = sel::le32(resp->data + sel::info::additionTimestamp);
     const uint32_t newErase = sel::le32(resp->data + sel::info::eraseTimestamp);
     const uint16_t newCount = sel::le16(resp->data + sel::info::entries);
     uint32_t oldAdd, oldErase;
-    uint16_t oldCount, last;
-    bool firstAnswer;
+    uint16_t last;
+    bool nothingStored;
     {
         TAV::MutexLock guard(n.selMutex);
         const ipmiifc_sel_info stored = headerOf(n);
         oldAdd = stored.addition_timestamp;
         oldErase = stored.erase_timestamp;
-        oldCount = stored.entries;
-        firstAnswer = stored.version == 0 && oldAdd == 0 && oldErase == 0;
+        nothingStored = stored.version == 0 && oldAdd == 0 && oldErase == 0;
         last = n.work.sel.last_record_id;
     }
-    // Stamps count whole seconds: a record logged in the same second as the
-    // last answer leaves them as they were, but not the entry count. The
-    // first answer is stored even when a never-used log reports no stamps.
-    if (!cli && !firstAnswer && oldAdd == newAdd && oldErase == newErase && oldCount == newCount) return 0;
+    if (!cli && oldAdd == newAdd && oldErase == newErase) return 0;
     const uint32_t since = oldAdd != 0 ? oldAdd : newAdd;
 
+    std::vector<std::shared_ptr<IpmiSelData>> previous;  // released outside the lock
     if (!cli && oldErase == newErase) {
-        std::vector<std::shared_ptr<IpmiSelData>> stale;  // from before a restart; released outside the lock
-        {
+        // Records held from before a restart would be read again behind themselves.
+        if (nothingStored) {
             TAV::MutexLock guard(n.selMutex);
-            f.deliverNew = !firstAnswer;
-            if (firstAnswer) {
-                f.pending.clear();
-                stale.swap(n.selRecords);
-            }
+            previous.swap(n.selRecords);
         }
-        stale.clear();
+        previous.clear();
         IpmiIfcSelReserve(node);
         readNew(node, last, static_cast<uint32_t>(newCount) + 1);
         {
@@ -469,55 +441,40 @@ uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
         return 0;
     }
 
-    std::vector<std::shared_ptr<IpmiSelData>> previous;
     {
         TAV::MutexLock guard(n.selMutex);
-        f.deliverNew = !firstAnswer && !cli;
-        f.known.clear();
-        if (firstAnswer) f.pending.clear();
-        if (f.deliverNew) {
-            for (const auto& r : n.selRecords) f.known.push_back(bytesOf(r->record()));
-            std::sort(f.known.begin(), f.known.end());
-        }
         storeHeader(n, resp->data, node);
         n.work.sel.last_record_id = 0;
     }
     IpmiIfcSelReserve(node);
     {
         TAV::MutexLock guard(n.selMutex);
-        previous.swap(n.selRecords);  // released outside the lock
+        previous.swap(n.selRecords);
     }
     previous.clear();
     IpmiIfcSelGetAll(node);
-    {
-        TAV::MutexLock guard(n.selMutex);
-        f.known.clear();
-        f.known.shrink_to_fit();
-    }
     IpmiIfcSelGenerateEvents(node, since);
     return 0;
 }
 
 int IpmiIfcRhSelInfoNoCount(ipmiifc_resp* resp) { return static_cast<int>(IpmiIfcRhSelInfo(resp, nullptr)); }
 
-// Hands the records that reading found new to the handlers, oldest first.
-// `sinceTimestamp` is the addition stamp the pass started from; newness was
-// decided while reading (see IpmiIfcRhSelInfo), so it is not compared here.
+// Hands the event records stamped after `sinceTimestamp` to the handlers,
+// oldest first (0xFFFFFFFF: every event record). The list's length is read
+// again after each record, so records appended meanwhile are visited too.
 uint32_t IpmiIfcSelGenerateEvents(int node, uint32_t sinceTimestamp) {
-    (void)sinceTimestamp;
+    if (_getState(0) == IpmiIfc::IPMI_STATE_CLI) return 0;
     IpmiNode& n = slot(node);
-    SelFollow& f = followOf(node);
-    const bool cli = _getState(0) == IpmiIfc::IPMI_STATE_CLI;
-    for (;;) {
+    for (size_t i = 0;; ++i) {
         std::shared_ptr<IpmiSelData> record;
         {
             TAV::MutexLock guard(n.selMutex);
-            if (cli) f.pending.clear();
-            if (f.pending.empty()) return 0;
-            record = std::move(f.pending.front());
-            f.pending.pop_front();
+            if (i >= n.selRecords.size()) return 0;
+            record = n.selRecords[i];
         }
-        if (record->isSelEventRecord()) IpmiIfcSelCallHandlers(record.get());
+        if (!record->isSelEventRecord()) continue;
+        if (record->messageTimeStamp() <= sinceTimestamp && sinceTimestamp != 0xFFFFFFFF) continue;
+        IpmiIfcSelCallHandlers(record.get());
     }
 }
 
