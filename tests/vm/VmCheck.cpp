@@ -219,18 +219,18 @@ void checkSensors(Checks& checks) {
         const std::vector<std::string>& row = rowOf[match->name];
         const std::string what = "sensor " + match->name;
         ++compared;
+        const unsigned raw = s->getReading(true);
+        if (row[1] == "na") {
+            checks.expect(s->readingStateUnavailable() || s->scanningDisabled(), what + " has no reading");
+            continue;
+        }
         if (s->isDiscrete()) {
-            unsigned state = s->getState(true) & 0x7FFF;
+            unsigned state = s->getState(false) & 0x7FFF;
             unsigned theirs = static_cast<unsigned>(strtoul(row[3].c_str(), nullptr, 16));
             theirs = ((theirs >> 8) | ((theirs & 0xFF) << 8)) & 0x7FFF;
             char detail[64];
             snprintf(detail, sizeof detail, "state 0x%04x, ipmitool 0x%04x", state, theirs);
             checks.expect(state == theirs, what, detail);
-            continue;
-        }
-        const unsigned raw = s->getReading(true);
-        if (row[1] == "na") {
-            checks.expect(s->readingStateUnavailable() || s->scanningDisabled(), what + " has no reading");
             continue;
         }
         const double value = s->convertRawValue(raw);
