@@ -1,6 +1,8 @@
 #!/usr/bin/env bash
 # Builds tav-ipmi and runs every test: a plain build, then AddressSanitizer +
-# UndefinedBehaviorSanitizer, then ThreadSanitizer.
+# UndefinedBehaviorSanitizer, then ThreadSanitizer, the fuzz targets, and last
+# the library on the kernel's IPMI driver in a QEMU guest (skipped where QEMU
+# cannot run).
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/install-deps.sh
@@ -16,7 +18,8 @@ build() {
 # Every option this script relies on is set here, so a build directory left by
 # another script (the demo builds no tests) cannot silently drop tests.
 echo "== plain build"
-build build -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=ON -DTAV_IPMI_BUILD_TOOL=ON -DTAV_IPMI_SANITIZE=
+build build -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=ON -DTAV_IPMI_BUILD_TOOL=ON \
+  -DTAV_IPMI_BUILD_VM_TESTS=ON -DTAV_IPMI_SANITIZE=
 ctest --test-dir build --output-on-failure -j"$jobs"
 
 echo "== benchmarks (short run)"
@@ -36,3 +39,6 @@ TSAN_OPTIONS="halt_on_error=1" ctest --test-dir build-tsan --output-on-failure -
 
 echo "== fuzz targets (bounded run)"
 scripts/fuzz.sh "${TAV_IPMI_FUZZ_SECONDS:-20}"
+
+echo "== the kernel's IPMI driver in a QEMU guest"
+TAV_IPMI_VM_BUILD=build scripts/vm-test.sh
