@@ -339,8 +339,8 @@ void normalPass(Checks& checks) {
         kIpmitool + "lan set 1 netmask 255.255.255.0; " + kIpmitool + "lan set 1 defgw ipaddr 192.0.2.1; " +
         kIpmitool + "lan set 1 macaddr 52:54:00:12:34:56");
     checkViews(checks);
-    prepareSel();
     std::thread loop = startLoop(checks);
+    prepareSel();  // start clears the node's handler list
     checkSensors(checks);
     checkLan(checks);
     checkSel(checks);

@@ -37,6 +37,7 @@ void addSelRecords(Checks& checks) {
     const int before = selEntries();
     const bool added = proxy({kSelAdd, 2});
     const int after = selEntries();
+    printf("%s", run("ipmitool -I open sel elist").out.c_str());
     checks.expect(added && before == 3 && after == 5, "two SEL records added through the ipmi_sim console",
                   "ipmitool counts " + std::to_string(before) + ", then " + std::to_string(after));
 }
@@ -99,16 +100,19 @@ void checkFru(Checks& checks) {
     std::string mismatch;
     const auto frus = Ipmi::IpmiIfc::getFrus(0);
     for (const auto& fru : frus) ours.insert(fru->getDeviceId());
+    // A device counts as shown when ipmitool decodes at least one field of it.
+    std::set<int> shown;
     int device = -1;
     for (const std::string& line : lines(run("ipmitool -I open fru print").out)) {
         size_t id = line.find("(ID ");
         if (line.rfind("FRU Device Description", 0) == 0 && id != std::string::npos) {
             device = atoi(line.c_str() + id + 4);
-            if (!ours.count(static_cast<unsigned>(device))) mismatch += " missing " + std::to_string(device);
             continue;
         }
         size_t colon = line.find(" : ");
-        if (colon == std::string::npos || trim(line.substr(0, colon)) != "Board Serial") continue;
+        if (colon == std::string::npos || device < 0) continue;
+        shown.insert(device);
+        if (trim(line.substr(0, colon)) != "Board Serial") continue;
         const std::string theirs = trim(line.substr(colon + 3));
         for (const auto& fru : frus) {
             if (fru->getDeviceId() != device || !fru->getBoard()) continue;
@@ -117,6 +121,9 @@ void checkFru(Checks& checks) {
                             "' vs '" + theirs + "'";
         }
     }
+    for (int d : shown)
+        if (!ours.count(static_cast<unsigned>(d))) mismatch += " missing " + std::to_string(d);
+    if (!mismatch.empty()) printf("%s", run("ipmitool -I open fru print").out.c_str());
     checks.expect(!ours.empty() && mismatch.empty(), "FRU inventory matches ipmitool",
                   std::to_string(ours.size()) + " devices" + mismatch);
 }
