@@ -6,7 +6,7 @@ The proxy forwards the VM serial protocol both ways and can, on request, delay
 or drop requests (a slow or lossy controller). The guest asks for that in band:
 an OEM request (netfn 0x30, command 0xF0) that the proxy answers itself, so a
 fault starts exactly between two of the guest's own requests. The same channel
-lets the guest have SEL records added through ipmi_sim's console.
+passes lines to ipmi_sim's console (new SEL records, changed readings).
 
 Exit status: the guest's, 1 when it never reported one (crash, hang, time-out).
 """
@@ -22,13 +22,13 @@ import time
 
 MSG_END, CMD_END, ESCAPE = 0xA0, 0xA1, 0xAA
 CONTROL_NETFN, CONTROL_CMD = 0x30, 0xF0
-OP_DROP, OP_DELAY, OP_SEL_ADD = 1, 2, 3
+OP_DROP, OP_DELAY, OP_SEL_ADD, OP_CONSOLE = 1, 2, 3, 4
 ANY = 0xFF
 
 # A system event record as ipmi_sim's console takes it: record type, then 13
 # bytes (time stamp, generator, revision, sensor type and number, event type,
 # event data): a processor IERR asserted on sensor 0x52.
-SEL_RECORD = "0x02 0x00 0x00 0x00 0x00 0x20 0x00 0x04 0x07 0x52 0x6f 0x00 0xff 0xff"
+SEL_RECORD = "sel_add 0x20 0x02 0x00 0x00 0x00 0x00 0x20 0x00 0x04 0x07 0x52 0x6f 0x00 0xff 0xff"
 
 
 def free_port(kind=socket.SOCK_STREAM):
@@ -82,7 +82,7 @@ set_working_mc 0x20
             # hand them to SEL handlers as new events.
             dst.write("\nsel_enable 0x20 1000 0x0b\n")
             for _ in range(startup_records):
-                dst.write(f"sel_add 0x20 {SEL_RECORD}\n")
+                dst.write(SEL_RECORD + "\n")
         state = os.path.join(workdir, "state")
         os.makedirs(state, exist_ok=True)
         self.log = open(os.path.join(workdir, "ipmi_sim.log"), "w")
@@ -196,13 +196,14 @@ class Proxy:
         elif op == OP_DELAY and len(data) >= 3:
             self.delay = (data[1] | data[2] << 8) / 1000.0
             log(f"proxy: answers delayed by {self.delay:.1f} s")
-        elif op == OP_SEL_ADD and len(data) >= 2:
-            for _ in range(data[1]):
-                self.bmc.console(f"sel_add 0x20 {SEL_RECORD}")
+        elif op in (OP_SEL_ADD, OP_CONSOLE) and len(data) >= 2:
+            lines = [SEL_RECORD] * data[1] if op == OP_SEL_ADD else [data[1:].decode(errors="replace")]
+            for line in lines:
+                self.bmc.console(line)
+                log(f"proxy: ipmi_sim console: {line}")
             # The console and the serial link are served by one loop in
-            # ipmi_sim; a moment lets the records land before the guest asks.
+            # ipmi_sim; a moment lets the change land before the guest asks.
             time.sleep(0.5)
-            log(f"proxy: {data[1]} SEL record(s) added through the ipmi_sim console")
 
 
 def log(text):

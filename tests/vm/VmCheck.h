@@ -38,7 +38,7 @@ std::vector<std::string> lines(const std::string& text);
 std::vector<std::string> cells(const std::string& row);
 
 // Requests the host's proxy between QEMU and ipmi_sim answers itself.
-enum ProxyOp : uint8_t { kDrop = 1, kDelay = 2, kSelAdd = 3 };
+enum ProxyOp : uint8_t { kDrop = 1, kDelay = 2, kSelAdd = 3, kConsole = 4 };
 bool proxy(std::vector<uint8_t> request);
 
 // One full pass of the polling loop, waited for.
