@@ -123,7 +123,6 @@ class Proxy:
         self.port = self.listener.getsockname()[1]
         self.delay = 0.0
         self.drops = []  # [remaining, netfn, cmd]
-        self.dropped = 0
 
     def start(self, deadline):
         threading.Thread(target=self._run, args=(deadline,), daemon=True).start()
@@ -181,7 +180,6 @@ class Proxy:
         for rule in self.drops:
             if rule[0] > 0 and rule[1] in (ANY, netfn) and rule[2] in (ANY, cmd):
                 rule[0] -= 1
-                self.dropped += 1
                 log(f"proxy: dropped netfn 0x{netfn:02x} cmd 0x{cmd:02x}")
                 return
         if self.delay:
