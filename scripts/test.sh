@@ -1,6 +1,8 @@
 #!/usr/bin/env bash
 # Builds tav-ipmi and runs every test: a plain build, then AddressSanitizer +
-# UndefinedBehaviorSanitizer, then ThreadSanitizer.
+# UndefinedBehaviorSanitizer, then ThreadSanitizer, the fuzz targets, and last
+# the library on the kernel's IPMI driver in a QEMU guest (skipped where QEMU
+# cannot run).
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/install-deps.sh
@@ -16,7 +18,8 @@ build() {
 # Every option this script relies on is set here, so a build directory left by
 # another script (the demo builds no tests) cannot silently drop tests.
 echo "== plain build"
-build build -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=ON -DTAV_IPMI_BUILD_TOOL=ON -DTAV_IPMI_SANITIZE=
+build build -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=ON -DTAV_IPMI_BUILD_TOOL=ON \
+  -DTAV_IPMI_BUILD_VM_TESTS=ON -DTAV_IPMI_SANITIZE=
 ctest --test-dir build --output-on-failure -j"$jobs"
 
 echo "== install"
@@ -38,10 +41,13 @@ build build-tsan -DTAV_IPMI_SANITIZE=thread -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI
 TSAN_OPTIONS="halt_on_error=1" ctest --test-dir build-tsan --output-on-failure -j"$jobs" -E 'PeerTools|Peer'
 
 echo "== fuzz targets (bounded run, ASan + UBSan)"
-# About a minute per target; skipped where clang and its fuzzer runtime are missing.
+# Half a minute per target; skipped where clang and its fuzzer runtime are missing.
 if command -v clang++ >/dev/null &&
   compgen -G "/usr/lib/llvm-*/lib/clang/*/lib/linux/libclang_rt.fuzzer-x86_64.a" >/dev/null; then
-  scripts/fuzz.sh "${TAV_IPMI_FUZZ_SECONDS:-60}"
+  scripts/fuzz.sh "${TAV_IPMI_FUZZ_SECONDS:-30}"
 else
   echo "clang or libFuzzer not installable here: fuzz targets skipped"
 fi
+
+echo "== the kernel's IPMI driver in a QEMU guest"
+TAV_IPMI_VM_BUILD=build scripts/vm-test.sh

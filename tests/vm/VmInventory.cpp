@@ -1,0 +1,134 @@
+// SEL delivery and FRU inventory checks of the guest checker. Each half is
+// built only when the library's headers offer it, and reports itself skipped
+// otherwise.
+
+#include <stdio.h>
+#include <stdlib.h>
+
+#include <mutex>
+#include <set>
+#include <string>
+
+#include "IpmiIfc.h"
+#include "VmCheck.h"
+
+#if __has_include("IpmiSel.h")
+#include "IpmiSel.h"
+#define TAV_VM_HAS_SEL 1
+#endif
+#if __has_include("IpmiFru.h")
+#include "IpmiFru.h"
+#define TAV_VM_HAS_FRU 1
+#endif
+
+namespace VmCheck {
+
+namespace {
+
+int selEntries() {
+    for (const std::string& line : lines(run("ipmitool -I open sel info").out))
+        if (line.rfind("Entries", 0) == 0) return atoi(line.c_str() + line.find(':') + 1);
+    return -1;
+}
+
+// The host loaded three records before the guest booted; two more arrive
+// through ipmi_sim's console, and ipmitool sees all five.
+void addSelRecords(Checks& checks) {
+    const int before = selEntries();
+    const bool added = proxy({kSelAdd, 2});
+    const int after = selEntries();
+    printf("%s", run("ipmitool -I open sel elist").out.c_str());
+    checks.expect(added && before == 3 && after == 5, "two SEL records added through the ipmi_sim console",
+                  "ipmitool counts " + std::to_string(before) + ", then " + std::to_string(after));
+}
+
+}  // namespace
+
+#ifdef TAV_VM_HAS_SEL
+namespace {
+
+std::mutex deliveredMutex;
+std::multiset<unsigned> delivered;  // record IDs handed to the handler
+
+void onSelRecord(void*, Ipmi::IpmiSelData* record) {
+    if (record == nullptr) return;  // the loop's per-pass call without a record
+    std::lock_guard<std::mutex> lock(deliveredMutex);
+    delivered.insert(record->recordId());
+}
+
+size_t deliveredCount() {
+    std::lock_guard<std::mutex> lock(deliveredMutex);
+    return delivered.size();
+}
+
+}  // namespace
+
+void prepareSel() { Ipmi::IpmiIfc::registerSelEventHandler(0, onSelRecord, nullptr); }
+
+// Records in the SEL before the guest booted are not news. Records added
+// through ipmi_sim's console while the loop runs are handed over once each,
+// however many passes follow.
+void checkSel(Checks& checks) {
+    fullPass();
+    checks.expect(deliveredCount() == 0, "SEL records present at start are not delivered",
+                  std::to_string(deliveredCount()) + " delivered");
+    addSelRecords(checks);
+    fullPass();
+    fullPass();
+    std::set<unsigned> distinct;
+    {
+        std::lock_guard<std::mutex> lock(deliveredMutex);
+        distinct.insert(delivered.begin(), delivered.end());
+    }
+    checks.expect(deliveredCount() == 2 && distinct.size() == 2, "each added SEL record is delivered exactly once",
+                  std::to_string(deliveredCount()) + " deliveries, " + std::to_string(distinct.size()) + " records");
+}
+#else
+void prepareSel() {}
+void checkSel(Checks& checks) {
+    addSelRecords(checks);
+    checks.skip("SEL delivery", "the library has no SEL reader yet");
+}
+#endif
+
+#ifdef TAV_VM_HAS_FRU
+// Every FRU device ipmitool prints is in the library's inventory, with the
+// same board serial number where the board area has one.
+void checkFru(Checks& checks) {
+    fullPass();
+    std::set<unsigned> ours;
+    std::string mismatch;
+    const auto frus = Ipmi::IpmiIfc::getFrus(0);
+    for (const auto& fru : frus) ours.insert(fru->getDeviceId());
+    // A device counts as shown when ipmitool decodes at least one field of it.
+    std::set<int> shown;
+    int device = -1;
+    for (const std::string& line : lines(run("ipmitool -I open fru print").out)) {
+        size_t id = line.find("(ID ");
+        if (line.rfind("FRU Device Description", 0) == 0 && id != std::string::npos) {
+            device = atoi(line.c_str() + id + 4);
+            continue;
+        }
+        size_t colon = line.find(" : ");
+        if (colon == std::string::npos || device < 0) continue;
+        shown.insert(device);
+        if (trim(line.substr(0, colon)) != "Board Serial") continue;
+        const std::string theirs = trim(line.substr(colon + 3));
+        for (const auto& fru : frus) {
+            if (fru->getDeviceId() != device || !fru->getBoard()) continue;
+            if (fru->getBoard()->getSerialNumber() != theirs)
+                mismatch += " device " + std::to_string(device) + " serial '" + fru->getBoard()->getSerialNumber() +
+                            "' vs '" + theirs + "'";
+        }
+    }
+    for (int d : shown)
+        if (!ours.count(static_cast<unsigned>(d))) mismatch += " missing " + std::to_string(d);
+    if (!mismatch.empty()) printf("%s", run("ipmitool -I open fru print").out.c_str());
+    checks.expect(!ours.empty() && mismatch.empty(), "FRU inventory matches ipmitool",
+                  std::to_string(ours.size()) + " devices" + mismatch);
+}
+#else
+void checkFru(Checks& checks) { checks.skip("FRU inventory", "the library has no FRU inventory yet"); }
+#endif
+
+}  // namespace VmCheck
