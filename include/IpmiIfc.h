@@ -167,7 +167,12 @@ public:
     // The last Get FRU Inventory Area Info answer of the node.
     static ipmiifc_fru_area_info getFruDeviceHeader(int node);
 
-    // SEL event handlers.
+    // SEL event handlers: called on the polling loop's thread with each new
+    // event record, and with null once every periodic pass. Node 0's list
+    // serves every node. `start` clears the list, so register once
+    // waitState reports the running state. Returns 0, or 5 for a null handler;
+    // unregistering returns 2 for a handler not in the list, and returns only
+    // once no other thread still runs the handler.
     static int registerSelEventHandler(int node, IpmiSelEventHandler handler, void* context);
     static int registerSelEventHandler(IpmiSelEventHandler handler, void* context);
     static int unRegisterSelEventHandler(int node, IpmiSelEventHandler handler);
