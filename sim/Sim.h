@@ -39,7 +39,8 @@ enum class FaultKind {
     CutAnswer,        // the real answer cut to `length` bytes
     AsyncEventFirst,  // an asynchronous event message is queued before the answer
     SendError,        // IPMICTL_SEND_COMMAND fails with errno `error`
-    ReceiveError      // IPMICTL_RECEIVE_MSG(_TRUNC) fails with errno `error`
+    ReceiveError,     // IPMICTL_RECEIVE_MSG(_TRUNC) fails with errno `error`
+    DuplicateAnswer   // the answer is queued twice: the copy is stale for the next request
 };
 
 struct Fault {
