@@ -112,11 +112,12 @@ int IpmiThresholdSensor::getHysteresis(unsigned char& positive, unsigned char& n
         uint8_t answer[3];
         const uint8_t code =
             sendSensorCommand(cmd::getSensorHysteresis, request, sizeof request, answer, sizeof answer);
-        // The cache holds what came back; when no bytes were copied, that is the code alone.
+        // A failed ask brings nothing back and leaves the cache as it was:
+        // one time-out must not make every cached query fail until the next poll.
+        if (code != cc::ok && code != kAnswerCut) return commandResult(code);
         hysteresis.cc = answer[0];
         hysteresis.positive = answer[1];
         hysteresis.negative = answer[2];
-        if (code != cc::ok && code != kAnswerCut) hysteresis.cc = code;
         if (code != cc::ok) return commandResult(code);
     }
     if (hysteresis.cc != cc::ok) return hysteresis.cc;
