@@ -156,6 +156,8 @@ void IpmiIfcSelCleanUpEventHandlers(int node) {
     }
 }
 
-bool IpmiIfc::generatesMemoryEvents(int node) { return slot(node).work.memory_events != 0; }
+bool IpmiIfc::generatesMemoryEvents(int node) {
+    return __atomic_load_n(&slot(node).work.memory_events, __ATOMIC_ACQUIRE) != 0;
+}
 
 }  // namespace Ipmi
