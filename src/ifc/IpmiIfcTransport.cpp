@@ -180,7 +180,8 @@ ipmiifc_resp* failExchange(int node, ipmiifc_resp* reuse) {
 ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiifc_resp* reuse) {
     IpmiNode& n = g_IpmiNode[0];
     TAV::MutexLock exchange(n.transportMutex);
-    if (n.fd < 1 || n.stopRequested) return nullptr;
+    // The flag first: once it is set, stop closes the device without this mutex.
+    if (n.stopRequested || n.fd < 1) return nullptr;
 
     struct ipmi_addr addr;
     buildAddress(n, &addr);
