@@ -83,6 +83,8 @@ public:
     bool enabled() const { return enabled_.load(); }
     void enable(bool on) { enabled_.store(on); }
     int64_t offsetNs() const { return offset_.load(); }
+    // Back to real time of day (a fuzz target between inputs).
+    void reset() { offset_.store(0); }
     void advanceNs(int64_t ns) {
         if (ns > 0) offset_.fetch_add(ns);
     }

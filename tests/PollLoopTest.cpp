@@ -227,7 +227,10 @@ namespace {
 // sensors afresh, as callers may while the loop stores its own readings.
 void readEveryCachedObject(bool ask) {
     for (const auto& s : IpmiIfc::getSensors()) {
-        if (ask) (void)s->getReading();
+        try {
+            if (ask) (void)(s->getReading() + s->getUpperCriticalThreshold());
+        } catch (const kelInt::CmpiStatus&) {
+        }
         try {
             (void)s->getState(false);
         } catch (const kelInt::CmpiStatus&) {
