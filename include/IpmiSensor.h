@@ -9,6 +9,7 @@
 
 #include "IpmiEntity.h"
 #include "IpmiSdrRecord.h"
+#include "Mutex.h"
 #include "TavIpmiExport.h"
 
 namespace Ipmi {
@@ -16,6 +17,10 @@ namespace Ipmi {
 // One sensor, built from its full, compact or event-only SDR, of which it
 // keeps a copy. Record questions are answered from that copy; readings,
 // thresholds and event settings are asked of the controller.
+//
+// The reading, poll bookkeeping, thresholds and hysteresis cache are guarded
+// by the sensor's own lock: any thread may read them while the polling loop
+// refreshes them.
 //
 // Value getters throw kelInt::CmpiStatus (CMPI_RC_ERR_FAILED); commands return
 // the completion code, with 0xC1 (invalid command) and 0xCD (illegal for this
@@ -62,7 +67,7 @@ public:
     bool isNormalMinSet() const;
     bool readingStateUnavailable() const;
     bool scanningDisabled() const;
-    bool hasReadingTime() const { return reading_time != 0; }
+    bool hasReadingTime() const;
     const unsigned char* getSdr() const { return sdr.data; }
     void RawRecord(const unsigned char*& bytes, int& length) const;
     IpmiEntity getEntity() const;
@@ -126,8 +131,8 @@ public:
     static std::string DescFromDirection(unsigned char direction);
 
     // Poll bookkeeping of the discovery and refresh passes.
-    uint32_t getLastPollResult() const { return last_poll_result; }
-    int32_t getPollRepeatCount() const { return poll_repeat_count; }
+    uint32_t getLastPollResult() const;
+    int32_t getPollRepeatCount() const;
     // Counts how often the same result came back in a row.
     void recordPollResult(uint32_t result);
 
@@ -141,6 +146,22 @@ protected:
         uint8_t positive;
         uint8_t negative;
     };
+
+    // One consistent view of the last reading.
+    struct ReadingSnapshot {
+        unsigned char bytes[5];
+        unsigned char length;
+        bool valid;
+        bool present;
+        uint64_t time;
+    };
+    // The reading as it stands, copied under the lock.
+    ReadingSnapshot currentReading() const;
+    // Asks the controller (as getSDReading), stores the outcome and returns it,
+    // so that the caller works on its own reading whatever other threads store.
+    ReadingSnapshot refreshReading();
+    // Clears not_available_pending (true) or request_failed_pending (false).
+    void clearPending(bool notAvailable);
 
     // The stored record and how many of its bytes may be read: the stored
     // length can exceed the buffer when an over-long record was refused.
@@ -169,6 +190,9 @@ protected:
     unsigned char sensor_number;
     unsigned short record_id;
     unsigned char reading_length;
+    // Guards everything above from `reading` to `hysteresis`; the record and
+    // the key fields never change after construction.
+    mutable TAV::Mutex state_mutex;
 
     // Event-enable and re-arm commands; the classes differ only in how many
     // bits of each mask's high byte they pass on.

@@ -23,9 +23,19 @@ for t in "${targets[@]}"; do
   mkdir -p "$corpus"
   seeds=()
   [ -d "fuzz/seeds/$t" ] && seeds+=("fuzz/seeds/$t")
+  # Real data seeds the targets it fits, read in place (libFuzzer writes only
+  # to the first corpus directory); a long seed is cut at -max_len.
+  real=../shared/data/real
+  options=()
+  case $t in
+    SensorRecordFuzz | EntityTreeFuzz | SdrReaderFuzz)
+      [ -d "$real/sdr" ] && seeds+=("$real/sdr")
+      options+=(-max_len=4096) ;;
+    HealthRulesFuzz) seeds+=(data) options+=(-max_len=2048) ;;
+  esac
   echo "== $t: ${seconds}s"
   # The fuzzer's own threads keep real time: the simulator's virtual clock is
-  # off unless a target installs it, and rss_limit_mb=0 stops the memory watch.
-  "$dir/fuzz/$t" -max_total_time="$seconds" -rss_limit_mb=0 -print_final_stats=1 \
+  # on only while a target runs one input, and rss_limit_mb=0 stops the memory watch.
+  "$dir/fuzz/$t" -max_total_time="$seconds" -rss_limit_mb=0 -print_final_stats=1 "${options[@]}" \
     -artifact_prefix="$dir/artifacts/$t-" "$corpus" "${seeds[@]}" 2>&1 | tail -n 12
 done

@@ -40,7 +40,8 @@ enum class FaultKind {
     CutAnswer,        // the real answer cut to `length` bytes
     AsyncEventFirst,  // an asynchronous event message is queued before the answer
     SendError,        // IPMICTL_SEND_COMMAND fails with errno `error`
-    ReceiveError      // IPMICTL_RECEIVE_MSG(_TRUNC) fails with errno `error`
+    ReceiveError,     // IPMICTL_RECEIVE_MSG(_TRUNC) fails with errno `error`
+    DuplicateAnswer   // the answer is queued twice: the copy is stale for the next request
 };
 
 struct Fault {
@@ -83,6 +84,8 @@ public:
     bool enabled() const { return enabled_.load(); }
     void enable(bool on) { enabled_.store(on); }
     int64_t offsetNs() const { return offset_.load(); }
+    // Back to real time of day (a fuzz target between inputs).
+    void reset() { offset_.store(0); }
     void advanceNs(int64_t ns) {
         if (ns > 0) offset_.fetch_add(ns);
     }

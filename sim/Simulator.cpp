@@ -312,9 +312,12 @@ int Simulator::sendCommand(DeviceHandle& h, void* arg) {
     m.netfn = static_cast<uint8_t>(r.netfn | kResponseBit);
     m.cmd = r.cmd;
     m.data = answer;
-    h.queue.push_back(m);
-    uint64_t one = 1;
-    (void)!write(h.eventFd, &one, sizeof one);
+    const int copies = applied.times != 0 && applied.kind == FaultKind::DuplicateAnswer ? 2 : 1;
+    for (int i = 0; i < copies; ++i) {
+        h.queue.push_back(m);
+        uint64_t one = 1;
+        (void)!write(h.eventFd, &one, sizeof one);
+    }
     return 0;
 }
 

@@ -2,8 +2,11 @@
 
 #include <atomic>
 #include <stdexcept>
+#include <thread>
 #include <vector>
 
+#include "CmpiStatus.h"
+#include "IpmiSensor.h"
 #include "TestSupport.h"
 
 using namespace Ipmi;
@@ -218,3 +221,60 @@ TEST_F(PollLoop, HandlerRegistrationRules) {
 }
 
 }  // namespace
+
+namespace {
+
+// Everything a caller can read of the cached objects; `ask` also reads the
+// sensors afresh, as callers may while the loop stores its own readings.
+void readEveryCachedObject(bool ask) {
+    for (const auto& s : IpmiIfc::getSensors()) {
+        try {
+            if (ask) (void)(s->getReading() + s->getUpperCriticalThreshold());
+        } catch (const kelInt::CmpiStatus&) {
+        }
+        try {
+            (void)s->getState(false);
+        } catch (const kelInt::CmpiStatus&) {
+        }
+        (void)s->convertToEnumeration();
+        (void)(s->readingStateUnavailable() + s->scanningDisabled() + s->hasReadingTime());
+        (void)(s->getLastPollResult() + s->getPollRepeatCount());
+        std::string when;
+        s->getReadingTime(when);
+        unsigned char positive, negative;
+        if (auto* t = dynamic_cast<IpmiThresholdSensor*>(s.get())) (void)t->getHysteresis(positive, negative, false);
+    }
+    for (const IpmiEntity& e : IpmiIfc::getEntities()) (void)IpmiIfc::getEntityParent(e.id, e.instance);
+    IpmiLan& lan = *IpmiIfc::getLan();
+    (void)(lan.getMACAddress() + lan.getIPv4Address() + lan.getIPv4DefaultGateway());
+    (void)lan.getIPv6Addresses();
+    (void)IpmiIfc::generatesMemoryEvents(0);
+}
+
+}  // namespace
+
+// Callers read every cached object from several threads while the loop
+// refreshes the readings, rebuilds sensors and entities, and stops.
+TEST_F(PollLoop, CallersReadTheCachesWhileTheLoopRefreshesRebuildsAndStops) {
+    useBmc(Sim::loadProfile(Sim::defaultProfilePath()));
+    startLoop(0);
+    ASSERT_FALSE(IpmiIfc::getSensors().empty());
+    std::atomic<bool> done{false};
+    std::atomic<unsigned> looks{0};
+    auto caller = [&](bool ask) {
+        while (!done.load()) {
+            readEveryCachedObject(ask);
+            ++looks;
+        }
+    };
+    std::thread a(caller, true), b(caller, false), c(caller, false);
+    for (int i = 0; (i < 6 || looks.load() < 30) && i < 100000; ++i)
+        pass(i % 3 == 2 ? IPMI_POLL_FULL : IPMI_POLL_SENSORS);
+    const unsigned beforeStop = looks.load();
+    loop_->stop();
+    waitUntil([&] { return looks.load() > beforeStop + 6; });
+    done = true;
+    a.join();
+    b.join();
+    c.join();
+}

@@ -210,6 +210,16 @@ TEST_F(SensorDiscovery, RediscoveryStartsAfreshAndCallersKeepTheirCopies) {
     add(record(kEventOnly, 3, kSensorSpecific, kMemory));  // needs no mask
     discover();
     EXPECT_TRUE(IpmiIfc::generatesMemoryEvents(0));
+    // Nor does a rebuild that finds the flag again clear it meanwhile.
+    bool clearedMeanwhile = false;
+    bmc().on(se, cmd::getSensorReading, [&clearedMeanwhile](Sim::Bmc&, const Sim::Request&) {
+        clearedMeanwhile |= !IpmiIfc::generatesMemoryEvents(0);
+        return Sim::Response{cc::requestedSensorNotPresent};
+    });
+    sim().resetCounters();
+    discover();
+    EXPECT_EQ(readsOf(1), 1u);
+    EXPECT_FALSE(clearedMeanwhile);
 
     EXPECT_EQ(IpmiIfc::getSensor(0x20, 1), nullptr);
     EXPECT_EQ(IpmiIfc::getSensor(0, 0x20, 1), nullptr);

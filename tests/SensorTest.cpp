@@ -213,9 +213,12 @@ TEST_F(SensorTest, HysteresisIsCachedUntilAskedAfresh) {
     EXPECT_EQ(hysteresis(false), (std::vector<int>{0, 2, 3})) << "setting does not touch the cache";
     EXPECT_EQ(hysteresis(true), (std::vector<int>{0, 4, 5}));
 
+    // A failed fresh ask reports its code and keeps what the cache held.
     sim().addFault(se, cmd::getSensorHysteresis, Fault::completionCode(cc::nodeBusy));
     EXPECT_EQ(hysteresis(true), (std::vector<int>{cc::nodeBusy, 9, 9}));
-    EXPECT_EQ(hysteresis(false)[0], cc::nodeBusy);
+    sim().addFault(se, cmd::getSensorHysteresis, Fault::of(FaultKind::NoAnswer));
+    EXPECT_EQ(hysteresis(true), (std::vector<int>{0xFF, 9, 9}));
+    EXPECT_EQ(hysteresis(false), (std::vector<int>{0, 4, 5}));
 }
 
 }  // namespace

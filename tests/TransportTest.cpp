@@ -93,6 +93,22 @@ TEST_F(Transport, SendAndReceiveFailures) {
     EXPECT_EQ(log.countAtPriority(LOG_ERR), 0u) << log.dump();  // nor is a would-block logged
 }
 
+// An answer left queued behind an event, or sent twice, is dropped: the next
+// request gets its own answer (a reservation, not a Device ID).
+TEST_F(Transport, StaleAnswersNeverAnswerALaterRequest) {
+    for (Sim::FaultKind kind : {Sim::FaultKind::AsyncEventFirst, Sim::FaultKind::DuplicateAnswer}) {
+        fault(Sim::Fault::of(kind));
+        RespHolder first(deviceId());
+        log.clear();
+        RespHolder next(IpmiIfcSendCmd(0, cmd::reserveSdrRepository, netfn::storage, 0, 0, nullptr, 0));
+        ASSERT_TRUE(next);
+        EXPECT_EQ(next->data_len, 3u);
+        EXPECT_EQ(next->data[1] | next->data[2] << 8, bmc().sdr.reservation);
+        EXPECT_TRUE(log.contains(LOG_DEBUG, "Node 0: dropped a stale answer (msgid 0, netfn 0x07, cmd 0x01)"))
+            << log.dump();
+    }
+}
+
 TEST_F(Transport, NothingIsSentWhileStoppingOrClosed) {
     node().stopRequested = true;
     EXPECT_EQ(deviceId(), nullptr);

@@ -9,6 +9,7 @@
 #include <atomic>
 #include <memory>
 #include <new>
+#include <vector>
 
 #include "IpmiIfcInternal.h"
 #include "SdrLayout.h"
@@ -209,6 +210,12 @@ ipmiifc_sdr_list* nextSharedInstance(const ipmiifc_sdr_list* element, const sdr:
     return copy;
 }
 
+void logRepeatedRecord(uint16_t id, uint32_t walked) {
+    ipmiLog(LOG_WARNING,
+            "IpmiIfcSdrGetHeaders: record ID 0x%04X comes again after %u records; the rest of the repository is ignored",
+            id, walked);
+}
+
 // The sensor, entity list and entity tree rebuilds that follow every record read.
 void rebuildFromRecords(int node) {
     IpmiIfcSensorInstantiateAll(node);
@@ -303,7 +310,10 @@ uint32_t IpmiIfcSdrGetHeaders(int node) {
     fillGetSdrRequest(request, storedReservation(s), kFirstRecordId, 0, sdr::header::length);
     uint32_t stored = 0;
     bool expired = false;
-    // Bounded by the record count: a controller whose next ids loop cannot keep us here.
+    // A repository whose next ids lead back to a record already read would
+    // keep the walk (and every read and sensor after it) going as long as the
+    // claimed record count allows: each id is walked once.
+    std::vector<bool> seen(kNoMoreRecords + 1u, false);
     while (stored < wanted) {
         RespHolder answer;
         for (int tries = 0; tries < kTriesPerRequest && !answer; ++tries) {
@@ -326,10 +336,20 @@ uint32_t IpmiIfcSdrGetHeaders(int node) {
             expired = true;
             break;
         }
+        const uint16_t id = le16(answer->data + kAnswerRecord);
+        if (seen[id]) {
+            logRepeatedRecord(id, stored);
+            break;
+        }
+        seen[id] = true;
         memcpy(headers + stored * sdr::header::length, answer->data + kAnswerRecord, sdr::header::length);
         ++stored;
         const uint16_t next = le16(answer->data + kAnswerNextRecordId);
         if (next == kNoMoreRecords) break;
+        if (seen[next]) {
+            logRepeatedRecord(next, stored);
+            break;
+        }
         putLe16(request + kRequestRecordId, next);
     }
     s.header_cnt = stored;

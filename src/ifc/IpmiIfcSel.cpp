@@ -557,7 +557,9 @@ void IpmiIfcSelCleanUpEventHandlers(int node) {
     }
 }
 
-bool IpmiIfc::generatesMemoryEvents(int node) { return slot(node).work.memory_events != 0; }
+bool IpmiIfc::generatesMemoryEvents(int node) {
+    return __atomic_load_n(&slot(node).work.memory_events, __ATOMIC_ACQUIRE) != 0;
+}
 
 // ---- Public SEL entry points -------------------------------------------------
 

@@ -149,11 +149,11 @@ void logDropped(const ipmiifc_sdr_list* element, uint8_t eventReadingType) {
                 eventReadingType);
 }
 
-void instantiateSensorRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list) {
+void instantiateSensorRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list, bool& memoryEvents) {
     for (ipmiifc_sdr_list* element = list; element != nullptr; element = element->next) {
         const sdr::SensorRecordView rec = viewOf(element);
         if (rec.sensorType() == kSensorTypeMemory && (rec.assertionMask() != 0 || rec.deassertionMask() != 0))
-            n.work.memory_events = 1;
+            memoryEvents = true;
         const SensorClass kind = classOf(rec.eventReadingType());
         if (kind == SensorClass::none) {
             logDropped(element, rec.eventReadingType());
@@ -167,10 +167,10 @@ void instantiateSensorRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list) {
 }
 
 // Event-only sensors have nothing to read; only threshold ones are asked for thresholds.
-void instantiateEventOnlyRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list) {
+void instantiateEventOnlyRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list, bool& memoryEvents) {
     for (ipmiifc_sdr_list* element = list; element != nullptr; element = element->next) {
         const sdr::EventOnlyView rec(element->data, element->length);
-        if (rec.sensorType() == kSensorTypeMemory) n.work.memory_events = 1;
+        if (rec.sensorType() == kSensorTypeMemory) memoryEvents = true;
         const SensorClass kind = classOfEventOnly(rec);
         if (kind == SensorClass::none) continue;
         std::shared_ptr<IpmiSensor> sensor = makeSensor(node, kind, element);
@@ -188,15 +188,18 @@ int IpmiIfcSensorInstantiateAll(int node) {
     CacheWriteLock guard(n.cacheLock);
     forgetBackReferences(n.work.sdr);
     n.sensors.clear();
-    n.work.memory_events = 0;
+    // Callers read the flag without the lock: it is worked out first and
+    // stored once, so a rebuild never shows it cleared for a moment.
+    bool memoryEvents = false;
     try {
-        instantiateSensorRecords(node, n, n.work.sdr.lists[SDR_GROUP_FULL]);
-        instantiateSensorRecords(node, n, n.work.sdr.lists[SDR_GROUP_COMPACT]);
-        instantiateEventOnlyRecords(node, n, n.work.sdr.lists[SDR_GROUP_EVENT_ONLY]);
+        instantiateSensorRecords(node, n, n.work.sdr.lists[SDR_GROUP_FULL], memoryEvents);
+        instantiateSensorRecords(node, n, n.work.sdr.lists[SDR_GROUP_COMPACT], memoryEvents);
+        instantiateEventOnlyRecords(node, n, n.work.sdr.lists[SDR_GROUP_EVENT_ONLY], memoryEvents);
     } catch (const std::bad_alloc&) {
         // Out of memory: callers get the sensors built so far.
         ipmiLog(LOG_ERR, "%s: failed memory alloc.", "IpmiIfcSensorInstantiateAll");
     }
+    __atomic_store_n(&n.work.memory_events, static_cast<uint8_t>(memoryEvents), __ATOMIC_RELEASE);
     return 0;
 }
 

@@ -8,6 +8,7 @@
 #include <stdlib.h>
 #include <string.h>
 #include <sys/ioctl.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <new>
@@ -150,6 +151,20 @@ void buildAddress(const IpmiNode& n, struct ipmi_addr* addr) {
     }
 }
 
+int64_t monotonicMs() {
+    struct timespec ts;
+    clock_gettime(CLOCK_MONOTONIC, &ts);
+    return static_cast<int64_t>(ts.tv_sec) * 1000 + ts.tv_nsec / 1000000;
+}
+
+// Whether a received message is the answer to the request just sent: the
+// driver hands back the message id, and an answer carries the request's
+// command with the response bit of its network function set.
+bool answers(const struct ipmi_recv& recv, const struct ipmi_req& sent) {
+    return recv.msgid == sent.msgid && (recv.msg.netfn & ~1u) == (sent.msg.netfn & ~1u) &&
+           recv.msg.cmd == sent.msg.cmd;
+}
+
 // Failure tail of a send or poll failure: the descriptor may be wedged.
 ipmiifc_resp* failExchange(int node, ipmiifc_resp* reuse) {
     ReopenPort(node);
@@ -165,7 +180,8 @@ ipmiifc_resp* failExchange(int node, ipmiifc_resp* reuse) {
 ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiifc_resp* reuse) {
     IpmiNode& n = g_IpmiNode[0];
     TAV::MutexLock exchange(n.transportMutex);
-    if (n.fd < 1 || n.stopRequested) return nullptr;
+    // The flag first: once it is set, stop closes the device without this mutex.
+    if (n.stopRequested || n.fd < 1) return nullptr;
 
     struct ipmi_addr addr;
     buildAddress(n, &addr);
@@ -188,66 +204,86 @@ ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiif
         return failExchange(node, reuse);
     }
 
-    struct pollfd fds[2];
-    fds[0].fd = n.fd;
-    fds[0].events = POLLIN;
-    fds[0].revents = 0;
-    fds[1].fd = n.signalCmdPipeFds[FD_READ];
-    fds[1].events = POLLIN;
-    fds[1].revents = 0;
-    int ready = ::poll(fds, 2, kAnswerWaitMs);
-    if (ready == 0) {
-        ipmiLog(LOG_WARNING, "Node %d: poll(fd=%d) timeout with no reply.", 0, n.fd);
-        return failExchange(node, reuse);
-    }
-    if (ready < 0) {
-        int err = errno;
-        ipmiLog(LOG_ERR, "Node %d: poll(fd=%d), errno=%d %s", 0, n.fd, err, strerror(err));
-        return failExchange(node, reuse);
-    }
-    if (n.stopRequested) return nullptr;
-    if (fds[0].revents != POLLIN) {
-        // Woken by the pipe, or the device reports an error: no answer to read.
-        if (reuse) {
-            reuse->cc = 0xFF;
-            return reuse;
+    // An answer that is not to this request (one left behind when an event
+    // ended an earlier exchange, or sent twice) is dropped and the wait goes
+    // on within the same time limit: a late answer must never satisfy a
+    // later request.
+    const int64_t deadlineMs = monotonicMs() + kAnswerWaitMs;
+    ipmiifc_resp* resp = nullptr;
+    for (;;) {
+        const int64_t leftMs = deadlineMs - monotonicMs();
+        struct pollfd fds[2];
+        fds[0].fd = n.fd;
+        fds[0].events = POLLIN;
+        fds[0].revents = 0;
+        fds[1].fd = n.signalCmdPipeFds[FD_READ];
+        fds[1].events = POLLIN;
+        fds[1].revents = 0;
+        int ready = leftMs > 0 ? ::poll(fds, 2, static_cast<int>(leftMs)) : 0;
+        if (ready == 0) {
+            ipmiLog(LOG_WARNING, "Node %d: poll(fd=%d) timeout with no reply.", 0, n.fd);
+            if (resp != reuse) IpmiIfcRespDel(&resp);
+            return failExchange(node, reuse);
         }
-        return nullptr;
-    }
-
-    ipmiifc_resp* resp = reuse;
-    int prepared = reuse ? IpmiIfcRespReuse(reuse) : IpmiIfcRespNew(&resp);
-    if (prepared != 0 || resp == nullptr) {
-        ipmiLog(LOG_ERR, "Node %d: alloc failed - not enough memory.", 0);
-        return nullptr;
-    }
-    memcpy(resp->data, &kEmptyReceiveMarker, sizeof kEmptyReceiveMarker);
-
-    unsigned char recvAddr[40];
-    memset(recvAddr, 0, sizeof recvAddr);
-    struct ipmi_recv recv;
-    memset(&recv, 0, sizeof recv);
-    recv.addr = recvAddr;
-    recv.addr_len = sizeof recvAddr;
-    recv.msg.data = resp->data;
-    recv.msg.data_len = IPMIIFC_RESP_MAX;
-    if (ioctl(n.fd, IPMICTL_RECEIVE_MSG_TRUNC, &recv) < 0 && errno != EMSGSIZE) {
-        int err = errno;
-        ReopenPort(node);
-        IpmiIfcRespDel(&resp);
-        if (err != EAGAIN) {
-            ipmiLog(LOG_ERR, "Node %d: ioctl IPMICTL_RECEIVE_MSG_TRUNC(fd=%d), errno(%d):%s", 0, n.fd,
-                    err, strerror(err));
+        if (ready < 0) {
+            int err = errno;
+            ipmiLog(LOG_ERR, "Node %d: poll(fd=%d), errno=%d %s", 0, n.fd, err, strerror(err));
+            if (resp != reuse) IpmiIfcRespDel(&resp);
+            return failExchange(node, reuse);
         }
-        return nullptr;
-    }
-    // The driver never reports more than the buffer; guard against one that does.
-    const uint32_t capacity = IPMIIFC_RESP_MAX;
-    resp->data_len = recv.msg.data_len > capacity ? capacity : recv.msg.data_len;
-    resp->cc = resp->data[0];
-    if (recv.recv_type == IPMI_ASYNC_EVENT_RECV_TYPE) {
-        IpmiIfcRespDel(&resp);
-        return nullptr;
+        if (n.stopRequested) {
+            if (resp != reuse) IpmiIfcRespDel(&resp);
+            return nullptr;
+        }
+        if (fds[0].revents != POLLIN) {
+            // Woken by the pipe, or the device reports an error: no answer to read.
+            if (resp != reuse) IpmiIfcRespDel(&resp);
+            if (reuse) {
+                reuse->cc = 0xFF;
+                return reuse;
+            }
+            return nullptr;
+        }
+
+        if (resp == nullptr) {
+            resp = reuse;
+            int prepared = reuse ? IpmiIfcRespReuse(reuse) : IpmiIfcRespNew(&resp);
+            if (prepared != 0 || resp == nullptr) {
+                ipmiLog(LOG_ERR, "Node %d: alloc failed - not enough memory.", 0);
+                return nullptr;
+            }
+        }
+        memcpy(resp->data, &kEmptyReceiveMarker, sizeof kEmptyReceiveMarker);
+
+        unsigned char recvAddr[40];
+        memset(recvAddr, 0, sizeof recvAddr);
+        struct ipmi_recv recv;
+        memset(&recv, 0, sizeof recv);
+        recv.addr = recvAddr;
+        recv.addr_len = sizeof recvAddr;
+        recv.msg.data = resp->data;
+        recv.msg.data_len = IPMIIFC_RESP_MAX;
+        if (ioctl(n.fd, IPMICTL_RECEIVE_MSG_TRUNC, &recv) < 0 && errno != EMSGSIZE) {
+            int err = errno;
+            ReopenPort(node);
+            IpmiIfcRespDel(&resp);
+            if (err != EAGAIN) {
+                ipmiLog(LOG_ERR, "Node %d: ioctl IPMICTL_RECEIVE_MSG_TRUNC(fd=%d), errno(%d):%s", 0, n.fd,
+                        err, strerror(err));
+            }
+            return nullptr;
+        }
+        // The driver never reports more than the buffer; guard against one that does.
+        const uint32_t capacity = IPMIIFC_RESP_MAX;
+        resp->data_len = recv.msg.data_len > capacity ? capacity : recv.msg.data_len;
+        resp->cc = resp->data[0];
+        if (recv.recv_type == IPMI_ASYNC_EVENT_RECV_TYPE) {
+            IpmiIfcRespDel(&resp);
+            return nullptr;
+        }
+        if (answers(recv, dreq)) break;
+        ipmiLog(LOG_DEBUG, "Node %d: dropped a stale answer (msgid %ld, netfn 0x%02x, cmd 0x%02x)", 0, recv.msgid,
+                recv.msg.netfn, recv.msg.cmd);
     }
     if (resp->cc != 0 || resp->data_len == 0) return resp;
 

@@ -22,24 +22,23 @@ constexpr uint8_t kHighStates = 0x7F;
 IpmiDiscreteSensor::~IpmiDiscreteSensor() {}
 
 unsigned int IpmiDiscreteSensor::getState(bool refresh) {
-    if (refresh) getSDReading();
-    if (!reading_valid) {
-        not_available_pending = false;
+    const ReadingSnapshot r = refresh ? refreshReading() : currentReading();
+    if (!r.valid) {
+        clearPending(true);
         throw kelInt::CmpiStatus(CMPI_RC_ERR_FAILED, "Discrete Sensor reading not available");
     }
     // All eight bits of byte 4, the reserved one included, as callers know it.
-    if (reading[0] == cc::ok) return reading[3] + reading[4] * 256u;
-    request_failed_pending = false;
+    if (r.bytes[0] == cc::ok) return r.bytes[3] + r.bytes[4] * 256u;
+    clearPending(false);
     throw kelInt::CmpiStatus(CMPI_RC_ERR_FAILED, "Discrete Sensor reading request failed");
 }
 
 bool IpmiDiscreteSensor::getSensorState(int& state) {
     state = 0;
-    getSDReading();
-    if (!sensor_present) return false;
-    if (!reading_valid) return true;
-    const uint16_t bits =
-        static_cast<uint16_t>(reading[3] | (reading_length > 4 ? (reading[4] & kHighStates) << 8 : 0));
+    const ReadingSnapshot r = refreshReading();
+    if (!r.present) return false;
+    if (!r.valid) return true;
+    const uint16_t bits = static_cast<uint16_t>(r.bytes[3] | (r.length > 4 ? (r.bytes[4] & kHighStates) << 8 : 0));
     try {
         state = getSensorHealthState(getEventReadingType(), getSensorType(), sensor_number, bits);
     } catch (const std::exception&) {

@@ -241,10 +241,14 @@ bool IpmiSensor::isNormalMinSet() const {
 }
 
 bool IpmiSensor::readingStateUnavailable() const {
-    return !reading_valid || (reading[2] & kStatusReadingUnavailable);
+    const ReadingSnapshot r = currentReading();
+    return !r.valid || (r.bytes[2] & kStatusReadingUnavailable);
 }
 
-bool IpmiSensor::scanningDisabled() const { return reading_valid && !(reading[2] & kStatusScanningEnabled); }
+bool IpmiSensor::scanningDisabled() const {
+    const ReadingSnapshot r = currentReading();
+    return r.valid && !(r.bytes[2] & kStatusScanningEnabled);
+}
 
 // The length handed out is what the buffer holds: an over-long record that
 // was refused keeps its length but none of its bytes.
@@ -262,7 +266,18 @@ int IpmiSensor::getManufacturerId(unsigned char* id, unsigned char& count) const
     return IpmiIfc::getManufacturerId(node, id, count);
 }
 
+uint32_t IpmiSensor::getLastPollResult() const {
+    TAV::MutexLock guard(state_mutex);
+    return last_poll_result;
+}
+
+int32_t IpmiSensor::getPollRepeatCount() const {
+    TAV::MutexLock guard(state_mutex);
+    return poll_repeat_count;
+}
+
 void IpmiSensor::recordPollResult(uint32_t result) {
+    TAV::MutexLock guard(state_mutex);
     if (result == last_poll_result) {
         if (poll_repeat_count < std::numeric_limits<int32_t>::max()) ++poll_repeat_count;
     } else {
@@ -289,40 +304,71 @@ uint8_t IpmiSensor::sendSensorCommand(uint8_t command, const uint8_t* request, u
 
 // ---- readings ----
 
-void IpmiSensor::getSDReading() {
-    sensor_present = true;
-    memset(reading, 0, sizeof reading);
+IpmiSensor::ReadingSnapshot IpmiSensor::currentReading() const {
+    TAV::MutexLock guard(state_mutex);
+    ReadingSnapshot now;
+    memcpy(now.bytes, reading, sizeof reading);
+    now.length = reading_length;
+    now.valid = reading_valid;
+    now.present = sensor_present;
+    now.time = reading_time;
+    return now;
+}
+
+IpmiSensor::ReadingSnapshot IpmiSensor::refreshReading() {
+    // Starts from what is stored: a software-owned sensor is never asked and
+    // keeps its validity, time and length.
+    ReadingSnapshot fresh = currentReading();
+    fresh.present = true;
+    memset(fresh.bytes, 0, sizeof fresh.bytes);
     const auto rec = recordOf(recordBytes(), readableLength());
+    bool absent = false;
+    uint8_t code = cc::ok;
     if (!rec.ownerIsSoftware()) {
         // The owner is addressed under the senders' lock: a request another
         // thread sends meanwhile still goes to its own target.
         RespHolder resp(IpmiIfcSendToOwner(node, cmd::getSensorReading, sensor_number, rec.ownerId(),
                                            rec.ownerChannel(), rec.ownerLun()));
-        uint16_t length = sizeof reading;
-        const uint8_t code = IpmiIfcCopyAnswer(resp.get(), &length, reading);
-
-        reading_valid = code == cc::ok;
-        if (code == cc::requestedSensorNotPresent) {
-            sensor_present = false;
-            return;
-        }
-        if (code != cc::ok) {
-            ipmiLog(LOG_WARNING, "IpmiSensor::getSDReading: unexpected return cc code for node: %d cmd: %d/%d was 0x%x",
-                    node, cmd::getSensorReading, netfn::sensorEvent, code);
-        } else {
-            reading_time = static_cast<uint64_t>(time(nullptr)) * 1000000u;
-            reading_length = static_cast<unsigned char>(length < kReadingBytes ? length : kReadingBytes);
+        uint16_t length = sizeof fresh.bytes;
+        code = IpmiIfcCopyAnswer(resp.get(), &length, fresh.bytes);
+        fresh.valid = code == cc::ok;
+        absent = code == cc::requestedSensorNotPresent;
+        if (absent) {
+            fresh.present = false;
+        } else if (code == cc::ok) {
+            fresh.time = static_cast<uint64_t>(time(nullptr)) * 1000000u;
+            fresh.length = static_cast<unsigned char>(length < kReadingBytes ? length : kReadingBytes);
         }
     }
-    if (sensor_present && !reading_valid)
+    {
+        TAV::MutexLock guard(state_mutex);
+        memcpy(reading, fresh.bytes, sizeof reading);
+        reading_length = fresh.length;
+        reading_valid = fresh.valid;
+        sensor_present = fresh.present;
+        reading_time = fresh.time;
+    }
+    if (absent) return fresh;
+    if (code != cc::ok)
+        ipmiLog(LOG_WARNING, "IpmiSensor::getSDReading: unexpected return cc code for node: %d cmd: %d/%d was 0x%x",
+                node, cmd::getSensorReading, netfn::sensorEvent, code);
+    if (fresh.present && !fresh.valid)
         ipmiLog(LOG_WARNING, "IpmiSensor::getSDReading no value read for sensor %d", sensor_number);
+    return fresh;
 }
 
+void IpmiSensor::clearPending(bool notAvailable) {
+    TAV::MutexLock guard(state_mutex);
+    (notAvailable ? not_available_pending : request_failed_pending) = false;
+}
+
+void IpmiSensor::getSDReading() { (void)refreshReading(); }
+
 unsigned int IpmiSensor::getReading() {
-    getSDReading();
-    if (!reading_valid || reading[0] != cc::ok) return 0;
-    if (isDiscrete()) return reading[3] | (reading_length > 4 ? (reading[4] & 0x7Fu) << 8 : 0u);
-    return reading[1];
+    const ReadingSnapshot r = refreshReading();
+    if (!r.valid || r.bytes[0] != cc::ok) return 0;
+    if (isDiscrete()) return r.bytes[3] | (r.length > 4 ? (r.bytes[4] & 0x7Fu) << 8 : 0u);
+    return r.bytes[1];
 }
 
 unsigned int IpmiSensor::getReading(bool) { return getReading(); }
@@ -331,18 +377,23 @@ double IpmiSensor::getReading(unsigned raw) { return convertRawValue(raw); }
 
 void IpmiSensor::setReading(unsigned char* five_bytes) {
     if (five_bytes == nullptr) return;
+    const uint64_t now = static_cast<uint64_t>(time(nullptr)) * 1000000u;
+    TAV::MutexLock guard(state_mutex);
     memcpy(reading, five_bytes, kReadingBytes);
     reading_valid = true;
-    reading_time = static_cast<uint64_t>(time(nullptr)) * 1000000u;
+    reading_time = now;
 }
 
 void IpmiSensor::setThresholdReading(unsigned char* eight_bytes) {
     if (eight_bytes == nullptr) return;
+    TAV::MutexLock guard(state_mutex);
     memcpy(threshold_reading, eight_bytes, kThresholdBytes);
 }
 
+bool IpmiSensor::hasReadingTime() const { return currentReading().time != 0; }
+
 void IpmiSensor::getReadingTime(std::string& out) const {
-    const time_t seconds = static_cast<time_t>(reading_time / 1000000u);
+    const time_t seconds = static_cast<time_t>(currentReading().time / 1000000u);
     struct tm utc;
     memset(&utc, 0, sizeof utc);
     gmtime_r(&seconds, &utc);

@@ -189,9 +189,10 @@ std::string IpmiSensor::getBaseUnitString() const {
 
 std::string IpmiSensor::convertToEnumeration() const {
     const sdr::SensorRecordView rec(recordBytes(), readableLength());
-    if (!rec.isFullOrCompact() || !reading_valid || reading[0] != 0) return word::notAvailable;
-    const unsigned low = reading_length > 3 ? reading[3] : 0;
-    const unsigned high = reading_length >= 5 ? (reading[4] & 0x7F) : 0;
+    const ReadingSnapshot r = currentReading();
+    if (!rec.isFullOrCompact() || !r.valid || r.bytes[0] != 0) return word::notAvailable;
+    const unsigned low = r.length > 3 ? r.bytes[3] : 0;
+    const unsigned high = r.length >= 5 ? (r.bytes[4] & 0x7F) : 0;
     if (low == 0 && high == 0) return word::notAvailable;
 
     const bool sensorSpecific = rec.eventReadingType() == EVENT_TYPE_SENSOR_SPECIFIC;

@@ -35,24 +35,24 @@ constexpr uint8_t kAnswerCut = 0x10;
 IpmiThresholdSensor::~IpmiThresholdSensor() {}
 
 unsigned int IpmiThresholdSensor::getState(bool refresh) {
-    if (refresh) getSDReading();
+    const ReadingSnapshot r = refresh ? refreshReading() : currentReading();
     // A sensor the controller does not have is not an error: its (zeroed)
     // reading says that no threshold is crossed.
-    if (sensor_present && !reading_valid) {
-        not_available_pending = false;
+    if (r.present && !r.valid) {
+        clearPending(true);
         throw kelInt::CmpiStatus(CMPI_RC_ERR_FAILED, "Threshold Sensor reading not available");
     }
-    if (reading[0] == cc::ok) return reading[3];
-    request_failed_pending = false;
+    if (r.bytes[0] == cc::ok) return r.bytes[3];
+    clearPending(false);
     throw kelInt::CmpiStatus(CMPI_RC_ERR_FAILED, "Threshold Sensor reading request failed");
 }
 
 bool IpmiThresholdSensor::getSensorState(int& state) {
     state = 0;
-    getSDReading();
-    if (!sensor_present) return false;
-    if (!reading_valid) return true;
-    const uint8_t crossed = reading[3];
+    const ReadingSnapshot r = refreshReading();
+    if (!r.present) return false;
+    if (!r.valid) return true;
+    const uint8_t crossed = r.bytes[3];
     if (crossed & kCriticalCrossings)
         state = kHealthCriticalFailure;
     else if (crossed & kNonCriticalCrossings)
@@ -112,13 +112,16 @@ int IpmiThresholdSensor::getHysteresis(unsigned char& positive, unsigned char& n
         uint8_t answer[3];
         const uint8_t code =
             sendSensorCommand(cmd::getSensorHysteresis, request, sizeof request, answer, sizeof answer);
-        // The cache holds what came back; when no bytes were copied, that is the code alone.
+        // A failed ask brings nothing back and leaves the cache as it was:
+        // one time-out must not make every cached query fail until the next poll.
+        if (code != cc::ok && code != kAnswerCut) return commandResult(code);
+        TAV::MutexLock guard(state_mutex);
         hysteresis.cc = answer[0];
         hysteresis.positive = answer[1];
         hysteresis.negative = answer[2];
-        if (code != cc::ok && code != kAnswerCut) hysteresis.cc = code;
         if (code != cc::ok) return commandResult(code);
     }
+    TAV::MutexLock guard(state_mutex);
     if (hysteresis.cc != cc::ok) return hysteresis.cc;
     positive = hysteresis.positive;
     negative = hysteresis.negative;
@@ -139,6 +142,7 @@ void IpmiThresholdSensor::cacheHysteresis() {
 }
 
 void IpmiThresholdSensor::cacheHysteresis(unsigned char positive, unsigned char negative) {
+    TAV::MutexLock guard(state_mutex);
     hysteresis.positive = positive;
     hysteresis.negative = negative;
 }
