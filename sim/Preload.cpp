@@ -5,6 +5,7 @@
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
+#include <unistd.h>
 
 #include <exception>
 
@@ -24,7 +25,10 @@ __attribute__((constructor)) void installFromEnvironment() {
         const char* vt = getenv("TAV_IPMI_SIM_VIRTUAL_TIME");
         Sim::Simulator::instance().install(Sim::loadProfile(path), vt != nullptr && strcmp(vt, "1") == 0);
     } catch (const std::exception& e) {
+        // Without its controller the program would reach for the real
+        // device and report that instead: stop here with the one reason.
         fprintf(stderr, "tav-ipmi simulator: %s\n", e.what());
+        _exit(2);
     }
 }
 

@@ -263,6 +263,7 @@ int IpmiSensor::getManufacturerId(unsigned char* id, unsigned char& count) const
 }
 
 void IpmiSensor::recordPollResult(uint32_t result) {
+    TAV::MutexLock lock(cacheMutex);
     if (result == last_poll_result) {
         if (poll_repeat_count < std::numeric_limits<int32_t>::max()) ++poll_repeat_count;
     } else {
@@ -290,29 +291,35 @@ uint8_t IpmiSensor::sendSensorCommand(uint8_t command, const uint8_t* request, u
 // ---- readings ----
 
 void IpmiSensor::getSDReading() {
-    sensor_present = true;
-    memset(reading, 0, sizeof reading);
+    uint8_t answer[kReadingBytes] = {0, 0, 0, 0, 0};
     const auto rec = recordOf(recordBytes(), readableLength());
-    if (!rec.ownerIsSoftware()) {
+    if (rec.ownerIsSoftware()) {
+        // Never read here: the sensor keeps whether its last reading was valid.
+        TAV::MutexLock lock(cacheMutex);
+        sensor_present = true;
+        memset(reading, 0, sizeof reading);
+    } else {
         // The owner is addressed under the senders' lock: a request another
         // thread sends meanwhile still goes to its own target.
         RespHolder resp(IpmiIfcSendToOwner(node, cmd::getSensorReading, sensor_number, rec.ownerId(),
                                            rec.ownerChannel(), rec.ownerLun()));
-        uint16_t length = sizeof reading;
-        const uint8_t code = IpmiIfcCopyAnswer(resp.get(), &length, reading);
-
-        reading_valid = code == cc::ok;
-        if (code == cc::requestedSensorNotPresent) {
-            sensor_present = false;
-            return;
+        uint16_t length = sizeof answer;
+        const uint8_t code = IpmiIfcCopyAnswer(resp.get(), &length, answer);
+        {
+            // Other threads read the cached reading while this one refreshes it.
+            TAV::MutexLock lock(cacheMutex);
+            memcpy(reading, answer, sizeof reading);
+            reading_valid = code == cc::ok;
+            sensor_present = code != cc::requestedSensorNotPresent;
+            if (code == cc::ok) {
+                reading_time = static_cast<uint64_t>(time(nullptr)) * 1000000u;
+                reading_length = static_cast<unsigned char>(length < kReadingBytes ? length : kReadingBytes);
+            }
         }
-        if (code != cc::ok) {
+        if (code == cc::requestedSensorNotPresent) return;
+        if (code != cc::ok)
             ipmiLog(LOG_WARNING, "IpmiSensor::getSDReading: unexpected return cc code for node: %d cmd: %d/%d was 0x%x",
                     node, cmd::getSensorReading, netfn::sensorEvent, code);
-        } else {
-            reading_time = static_cast<uint64_t>(time(nullptr)) * 1000000u;
-            reading_length = static_cast<unsigned char>(length < kReadingBytes ? length : kReadingBytes);
-        }
     }
     if (sensor_present && !reading_valid)
         ipmiLog(LOG_WARNING, "IpmiSensor::getSDReading no value read for sensor %d", sensor_number);
@@ -331,6 +338,7 @@ double IpmiSensor::getReading(unsigned raw) { return convertRawValue(raw); }
 
 void IpmiSensor::setReading(unsigned char* five_bytes) {
     if (five_bytes == nullptr) return;
+    TAV::MutexLock lock(cacheMutex);
     memcpy(reading, five_bytes, kReadingBytes);
     reading_valid = true;
     reading_time = static_cast<uint64_t>(time(nullptr)) * 1000000u;
@@ -338,7 +346,20 @@ void IpmiSensor::setReading(unsigned char* five_bytes) {
 
 void IpmiSensor::setThresholdReading(unsigned char* eight_bytes) {
     if (eight_bytes == nullptr) return;
+    TAV::MutexLock lock(cacheMutex);
     memcpy(threshold_reading, eight_bytes, kThresholdBytes);
+}
+
+IpmiSensor::CachedState IpmiSensor::getCachedState() const {
+    CachedState out;
+    TAV::MutexLock lock(cacheMutex);
+    memcpy(out.reading, reading, sizeof out.reading);
+    out.readingLength = reading_length;
+    out.readingValid = reading_valid;
+    out.lastPollResult = last_poll_result;
+    out.readingTime = reading_time;
+    memcpy(out.thresholds, threshold_reading, sizeof out.thresholds);
+    return out;
 }
 
 void IpmiSensor::getReadingTime(std::string& out) const {
