@@ -7,6 +7,7 @@
 #include <stdint.h>
 
 #include <atomic>
+#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -139,7 +140,12 @@ public:
     unsigned exchanges(uint8_t netfn, uint8_t cmd) const;
     unsigned totalExchanges() const;
     std::vector<Request> requests() const;
+    // Exchanges per command, keyed by netfn << 8 | cmd.
+    std::map<uint16_t, unsigned> counters() const;
     void resetCounters();
+    // Changes the controller's model between exchanges (a running program's
+    // simulator, changed from outside).
+    void withBmc(const std::function<void(Bmc&)>& change);
 
     // Real time each answer takes (benchmarks); 0 answers at once.
     void setLatencyUs(int64_t us) { latencyUs_.store(us); }

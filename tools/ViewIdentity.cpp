@@ -17,6 +17,14 @@ std::string firmwareRevision(const Ipmi::ipmiifc_device_id& id) {
     return text;
 }
 
+bool readIdentity() {
+    // The networking query opens and closes the device itself, and reads the
+    // device id, OS name and OS version on the way.
+    Ipmi::IpmiIfcOpenIpmiClose(0);
+    Ipmi::IpmiIfc::GetBMCNetworking();
+    return Ipmi::IpmiIfcOpenIpmiOpen(0) >= 0;
+}
+
 unsigned manufacturerId(const Ipmi::ipmiifc_device_id& id) {
     return id.manufacturer_id[0] | (id.manufacturer_id[1] << 8) | (id.manufacturer_id[2] << 16);
 }
@@ -55,11 +63,7 @@ std::string trimmed(std::string s) {
 }
 
 int identity(std::vector<Tool::Section>& out) {
-    // The networking query opens and closes the device itself, and reads the
-    // device id, OS name and OS version on the way.
-    Ipmi::IpmiIfcOpenIpmiClose(0);
-    Ipmi::IpmiIfc::GetBMCNetworking();
-    if (Ipmi::IpmiIfcOpenIpmiOpen(0) < 0) return 1;
+    if (!Tool::readIdentity()) return 1;
     Ipmi::ipmiifc_device_id id;
     if (Ipmi::IpmiIfc::getManagementControllerInfo(0, id) != 0) {
         fprintf(stderr, "tavipmi: no device id from the controller\n");

@@ -108,7 +108,7 @@ int runInCommandLineMode(const std::vector<std::string>& selected, Tool::Format 
         int r = Tool::views()[name].run(sections);
         if (r != 0) rc = r;
     }
-    Tool::render(sections, format, stdout);
+    if (!sections.empty()) Tool::render(sections, format, stdout);
     Ipmi::IpmiIfcCloseForCLI(0);
     Ipmi::IpmiIfcOpenIpmiClose(0);
     return rc;

@@ -1,0 +1,119 @@
+// `serve`: the polling loop on a thread of its own and an HTTP endpoint that
+// answers GET /metrics from the library's caches; `metrics`: the same text once.
+
+#include <errno.h>
+#include <pthread.h>
+#include <signal.h>
+#include <stdio.h>
+#include <string.h>
+
+#include <exception>
+#include <string>
+#include <thread>
+
+#include <CLI/CLI.hpp>
+#include <httplib.h>
+
+#include "CmpiStatus.h"
+#include "Identity.h"
+#include "IpmiIfc.h"
+#include "Metrics.h"
+#include "Views.h"
+
+namespace {
+
+std::string listen = "127.0.0.1:9623";
+int interval = 1;
+
+void serveOptions(CLI::App& sub) {
+    sub.add_option("--listen", listen, "HOST:PORT to answer on (default 127.0.0.1:9623)");
+    sub.add_option("--interval", interval, "polling interval in units of 16 seconds (default 1)")
+        ->check(CLI::PositiveNumber);
+}
+
+bool splitListen(const std::string& text, std::string& host, int& port) {
+    const size_t colon = text.rfind(':');
+    if (colon == std::string::npos || colon == 0) return false;
+    host = text.substr(0, colon);
+    if (host.size() > 2 && host.front() == '[' && host.back() == ']') host = host.substr(1, host.size() - 2);
+    char* end = nullptr;
+    const long p = strtol(text.c_str() + colon + 1, &end, 10);
+    if (*end != '\0' || p < 0 || p > 65535 || end == text.c_str() + colon + 1) return false;
+    port = static_cast<int>(p);
+    return true;
+}
+
+void runLoop() {
+    try {
+        Ipmi::IpmiIfc::start(0, interval);
+    } catch (const kelInt::CmpiStatus& e) {
+        fprintf(stderr, "tavipmi: the polling loop stopped: %s\n", e.msg());
+    } catch (const std::exception& e) {
+        fprintf(stderr, "tavipmi: the polling loop stopped: %s\n", e.what());
+    }
+}
+
+int serve(std::vector<Tool::Section>&) {
+    std::string host;
+    int port = 0;
+    if (!splitListen(listen, host, port)) {
+        fprintf(stderr, "tavipmi: --listen wants HOST:PORT, not '%s'\n", listen.c_str());
+        return 2;
+    }
+    // SIGTERM and SIGINT are taken by this thread alone, so every thread
+    // started from here on inherits the block.
+    sigset_t stopSignals;
+    sigemptyset(&stopSignals);
+    sigaddset(&stopSignals, SIGTERM);
+    sigaddset(&stopSignals, SIGINT);
+    pthread_sigmask(SIG_BLOCK, &stopSignals, nullptr);
+
+    httplib::Server server;
+    server.new_task_queue = [] { return new httplib::ThreadPool(2); };
+    server.Get("/metrics", [](const httplib::Request&, httplib::Response& res) {
+        res.set_content(Tool::metricsText(), "text/plain; version=0.0.4; charset=utf-8");
+    });
+    server.Get("/", [](const httplib::Request&, httplib::Response& res) {
+        res.set_content("tavipmi: metrics at /metrics\n", "text/plain; charset=utf-8");
+    });
+    if (!server.bind_to_port(host.c_str(), port)) {
+        fprintf(stderr, "tavipmi: cannot listen on %s: %s\n", listen.c_str(), strerror(errno));
+        return 1;
+    }
+
+    Tool::loadHealthRules();
+    std::thread loop(runLoop);
+    const int state =
+        Ipmi::IpmiIfc::waitState(0, Ipmi::IpmiIfc::IPMI_STATE_RUNNING | Ipmi::IpmiIfc::IPMI_STATE_STOPPED);
+    if (state != Ipmi::IpmiIfc::IPMI_STATE_RUNNING) {
+        fprintf(stderr, "tavipmi: cannot reach the controller through /dev/ipmi0\n");
+        loop.join();
+        return 1;
+    }
+    std::thread http([&server] { server.listen_after_bind(); });
+    fprintf(stderr, "tavipmi: serving metrics on http://%s/metrics\n", listen.c_str());
+
+    int sig = 0;
+    while (sigwait(&stopSignals, &sig) != 0) {
+    }
+    server.stop();
+    http.join();
+    Ipmi::IpmiIfc::stop(0);
+    loop.join();
+    return 0;
+}
+
+// Once, for node_exporter's textfile collector.
+int metrics(std::vector<Tool::Section>&) {
+    if (!Tool::readIdentity()) return 1;
+    if (Ipmi::IpmiIfcSdrGetInfo(0) != 0) fprintf(stderr, "tavipmi: could not read the SDR repository\n");
+    fputs(Tool::metricsText().c_str(), stdout);
+    return 0;
+}
+
+Tool::ViewRegistrar regServe("serve", Tool::View{"run the polling loop and answer GET /metrics (Prometheus text)",
+                                                 serveOptions, serve, 200, false, true});
+Tool::ViewRegistrar regMetrics("metrics", Tool::View{"print the /metrics text once (node_exporter textfile collector)",
+                                                     nullptr, metrics, 210, false});
+
+}  // namespace
