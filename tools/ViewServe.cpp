@@ -26,7 +26,7 @@ std::string listen = "127.0.0.1:9623";
 int interval = 1;
 
 void serveOptions(CLI::App& sub) {
-    sub.add_option("--listen", listen, "HOST:PORT to answer on (default 127.0.0.1:9623)");
+    sub.add_option("--listen", listen, "HOST:PORT to answer on (default 127.0.0.1:9623; port 0: any free port)");
     sub.add_option("--interval", interval, "polling interval in units of 16 seconds (default 1)")
         ->check(CLI::PositiveNumber);
 }
@@ -76,7 +76,10 @@ int serve(std::vector<Tool::Section>&) {
     server.Get("/", [](const httplib::Request&, httplib::Response& res) {
         res.set_content("tavipmi: metrics at /metrics\n", "text/plain; charset=utf-8");
     });
-    if (!server.bind_to_port(host.c_str(), port)) {
+    // Port 0 takes any free port; the message below names the one taken.
+    if (port == 0) port = server.bind_to_any_port(host.c_str());
+    else if (!server.bind_to_port(host.c_str(), port)) port = -1;
+    if (port <= 0) {
         fprintf(stderr, "tavipmi: cannot listen on %s: %s\n", listen.c_str(), strerror(errno));
         return 1;
     }
@@ -91,7 +94,8 @@ int serve(std::vector<Tool::Section>&) {
         return 1;
     }
     std::thread http([&server] { server.listen_after_bind(); });
-    fprintf(stderr, "tavipmi: serving metrics on http://%s/metrics\n", listen.c_str());
+    fprintf(stderr, "tavipmi: serving metrics on http://%s:%d/metrics\n",
+            host.find(':') == std::string::npos ? host.c_str() : ("[" + host + "]").c_str(), port);
 
     int sig = 0;
     while (sigwait(&stopSignals, &sig) != 0) {
