@@ -1,5 +1,8 @@
 #include "SensorFacts.h"
 
+#include <stdio.h>
+#include <stdlib.h>
+
 #include <algorithm>
 #include <exception>
 #include <memory>
@@ -30,6 +33,15 @@ constexpr unsigned kHighStates = 0x7F;
 constexpr unsigned kCritical = 0x36;     // LC, LNR, UC, UNR
 constexpr unsigned kNonCritical = 0x09;  // LNC, UNC
 
+// Conversions multiply by powers of ten and leave binary noise behind
+// (13.200000000000001): twelve significant digits are more than any
+// 8-bit reading carries.
+double tidy(double v) {
+    char text[32];
+    snprintf(text, sizeof text, "%.12g", v);
+    return strtod(text, nullptr);
+}
+
 std::string unitText(const Ipmi::IpmiSensor& s) {
     std::string unit = s.getBaseUnit() == 0 ? std::string() : s.getBaseUnitString();
     if (s.getFlags() & Ipmi::IpmiSensor::FLAG_PERCENTAGE) unit = unit.empty() ? "percent" : "percent " + unit;
@@ -54,7 +66,7 @@ void fillThresholds(const Ipmi::IpmiSensor& s, const Ipmi::IpmiSensor::CachedSta
     if (c.thresholds[0] != Ipmi::cc::ok || !s.isConvertible()) return;
     for (int t = 0; t < kThresholds; ++t)
         if (c.thresholds[1] & kThresholdPlaces[t].bit)
-            f.threshold[t] = s.convertRawValue(c.thresholds[kThresholdPlaces[t].answerByte]);
+            f.threshold[t] = tidy(s.convertRawValue(c.thresholds[kThresholdPlaces[t].answerByte]));
 }
 
 void fillReading(const Ipmi::IpmiSensor& s, const Ipmi::IpmiSensor::CachedState& c, SensorFacts& f, bool describe) {
@@ -83,7 +95,7 @@ void fillReading(const Ipmi::IpmiSensor& s, const Ipmi::IpmiSensor::CachedState&
     f.health = (crossed & kCritical) ? Ipmi::HEALTH_CRITICAL_FAILURE
                : (crossed & kNonCritical) ? Ipmi::HEALTH_DEGRADED
                                           : Ipmi::HEALTH_OK;
-    if (s.isConvertible()) f.reading = s.convertRawValue(c.reading[1]);
+    if (s.isConvertible()) f.reading = tidy(s.convertRawValue(c.reading[1]));
 }
 
 }  // namespace
