@@ -7,6 +7,7 @@
 #include <stdio.h>
 #include <string.h>
 
+#include <atomic>
 #include <exception>
 #include <string>
 #include <thread>
@@ -43,13 +44,17 @@ bool splitListen(const std::string& text, std::string& host, int& port) {
     return true;
 }
 
+std::atomic<bool> loopReported{false};
+
 void runLoop() {
     try {
         Ipmi::IpmiIfc::start(0, interval);
     } catch (const kelInt::CmpiStatus& e) {
         fprintf(stderr, "tavipmi: the polling loop stopped: %s\n", e.msg());
+        loopReported = true;
     } catch (const std::exception& e) {
         fprintf(stderr, "tavipmi: the polling loop stopped: %s\n", e.what());
+        loopReported = true;
     }
 }
 
@@ -89,8 +94,8 @@ int serve(std::vector<Tool::Section>&) {
     const int state =
         Ipmi::IpmiIfc::waitState(0, Ipmi::IpmiIfc::IPMI_STATE_RUNNING | Ipmi::IpmiIfc::IPMI_STATE_STOPPED);
     if (state != Ipmi::IpmiIfc::IPMI_STATE_RUNNING) {
-        fprintf(stderr, "tavipmi: cannot reach the controller through /dev/ipmi0\n");
         loop.join();
+        if (!loopReported) fprintf(stderr, "tavipmi: cannot open /dev/ipmi0\n");
         return 1;
     }
     std::thread http([&server] { server.listen_after_bind(); });
