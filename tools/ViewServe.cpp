@@ -74,7 +74,11 @@ int serve(std::vector<Tool::Section>&) {
     pthread_sigmask(SIG_BLOCK, &stopSignals, nullptr);
 
     httplib::Server server;
-    server.new_task_queue = [] { return new httplib::ThreadPool(2); };
+    // One worker answers one request per connection: a scrape takes
+    // milliseconds, and no client can hold the worker with an idle
+    // keep-alive connection.
+    server.new_task_queue = [] { return new httplib::ThreadPool(1); };
+    server.set_keep_alive_max_count(1);
     server.Get("/metrics", [](const httplib::Request&, httplib::Response& res) {
         res.set_content(Tool::metricsText(), "text/plain; version=0.0.4; charset=utf-8");
     });
