@@ -9,6 +9,7 @@
 
 #include "CmpiStatus.h"
 #include "IpmiEntity.h"
+#include "IpmiFru.h"
 #include "IpmiNode.h"
 #include "TavIpmiExport.h"
 
@@ -16,6 +17,8 @@ namespace Ipmi {
 
 class IpmiLan;
 class IpmiSensor;
+class IpmiSel;
+class IpmiSelData;
 
 // What a wake-up of the polling loop asks for.
 enum IPMI_POLL_TYPE {
@@ -49,6 +52,36 @@ struct ipmiifc_sdr_info {
     uint32_t addition_timestamp;
     uint32_t erase_timestamp;
     uint8_t operation_support;
+} __attribute__((packed));
+
+// The stored Get SEL Info answer, completion code first.
+struct ipmiifc_sel_info {
+    uint8_t cc;
+    uint8_t version;             // 0x51 for IPMI 1.5 and 2.0
+    uint16_t entries;
+    uint16_t free_space;         // bytes
+    uint32_t addition_timestamp;
+    uint32_t erase_timestamp;
+    uint8_t operation_support;   // bit 7: overflow
+} __attribute__((packed));
+
+// The stored Get SEL Allocation Info answer, completion code first.
+struct ipmiifc_sel_alloc_info {
+    uint8_t cc;
+    uint16_t units;
+    uint16_t unit_size;  // bytes; 0 when the controller does not say
+    uint16_t free_units;
+    uint16_t largest_free_block;
+    uint8_t max_record_units;
+} __attribute__((packed));
+
+// The stored Get FRU Inventory Area Info answer, completion code first, and
+// the FRU device it was asked for.
+struct ipmiifc_fru_area_info {
+    uint8_t cc;
+    uint16_t size;  // inventory area size in bytes
+    uint8_t access;  // bit 0 set: the device is accessed by words
+    uint8_t device_id;
 } __attribute__((packed));
 
 // Public entry points; every per-node operation has an overload for node 0.
@@ -122,12 +155,52 @@ public:
     static IpmiEntity getEntityParent(int node, unsigned int id, unsigned int instance);
     static IpmiEntity getEntityParent(unsigned int id, unsigned int instance);
 
+    // FRU inventory, as the last discovery pass found it. The list is
+    // replaced whole, so a caller never sees a half-built one; the objects
+    // stay valid for as long as the caller holds them.
+    static std::vector<std::shared_ptr<IpmiFru>> getFrus(int node);
+    static std::vector<std::shared_ptr<IpmiFru>> getFrus();
+    // One area of one FRU device, or null when the device or the area is
+    // absent (or the area failed to read or to pass its checksum).
+    static std::shared_ptr<const IpmiFruOptional> getFruPart(int node, uint8_t deviceId, IpmiFru::AreaKind kind);
+    static std::shared_ptr<const IpmiFruOptional> getFruPart(uint8_t deviceId, IpmiFru::AreaKind kind);
+    // The last Get FRU Inventory Area Info answer of the node.
+    static ipmiifc_fru_area_info getFruDeviceHeader(int node);
+
     // SEL event handlers.
     static int registerSelEventHandler(int node, IpmiSelEventHandler handler, void* context);
     static int registerSelEventHandler(IpmiSelEventHandler handler, void* context);
     static int unRegisterSelEventHandler(int node, IpmiSelEventHandler handler);
     static int unRegisterSelEventHandler(IpmiSelEventHandler handler);
     static bool generatesMemoryEvents(int node);
+
+    // System event log. Results of clearSel.
+    enum SEL_CLEAR_RESULT {
+        SEL_CLEAR_OK = 0,
+        SEL_CLEAR_NOT_CONFIRMED = 2,  // busy five times, or an unexpected erasure status
+        SEL_CLEAR_NO_ANSWER = 4,
+        SEL_CLEAR_REFUSED = 5         // another completion code (logged)
+    };
+    // The summary built from the last Get SEL Info answer; empty before one.
+    static std::shared_ptr<IpmiSel> getSel(int node);
+    static std::shared_ptr<IpmiSel> getSel();
+    // The records read so far, oldest first.
+    static std::vector<std::shared_ptr<IpmiSelData>> getSelData(int node);
+    static std::vector<std::shared_ptr<IpmiSelData>> getSelData();
+    static ipmiifc_sel_info getRawSelHeader(int node);
+    static ipmiifc_sel_info getRawSelHeader();
+    // Erases the controller's SEL; one of SEL_CLEAR_RESULT.
+    static int clearSel(int node);
+    static int clearSel();
+    // The record ID software last processed (PEF); 0 when unknown.
+    static uint16_t getLastProcessedSELEntry(int node);
+    static uint16_t getLastProcessedSELEntry();
+    static void setLastProcessedSELEntry(int node, uint16_t id);
+    static void setLastProcessedSELEntry(uint16_t id);
+    // The controller's SEL clock in seconds, 0 when it cannot be read. Uses a
+    // descriptor of its own, so it works with or without the polling loop.
+    static uint32_t GetSelClock();
+    static uint32_t selGetClock(int node);
 
     // LAN configuration.
     static IpmiLan* getLan(int node);
@@ -142,6 +215,12 @@ TAV_IPMI_API void IpmiIfcOpenIpmiClose(int node);
 // Reads the SDR repository when it changed and rebuilds sensors and entities
 // from it (the polling loop does this by itself; one-shot tools call it).
 TAV_IPMI_API uint32_t IpmiIfcSdrGetInfo(int node);
+// Asks for the SEL info and follows a change: reads new records or reloads
+// the log (one-shot tools call it to load the SEL). `count` may be null.
+TAV_IPMI_API uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count);
+// Reads every FRU device that the node's FRU device locator records name and
+// replaces the node's FRU list (the polling loop does this by itself).
+TAV_IPMI_API int IpmiIfcFruInstantiateAll(int node);
 
 }  // namespace Ipmi
 

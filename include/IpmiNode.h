@@ -77,6 +77,13 @@ struct ipmiifc_sel_handler {
 
 struct ipmiifc_entity_list;
 
+// FRU device access of one node; guarded by the node's fruMutex.
+struct ipmiifc_fru_state {
+    uint8_t area_info[5];  // last Get FRU Inventory Area Info: cc, size (LE), access type, FRU device ID
+    uint8_t header[8];     // common header of the device last read
+    uint32_t header_len;
+};
+
 // Everything InitIpmiNode clears besides the identity bytes.
 struct ipmiifc_node_work {
     ipmiifc_sdr_state sdr;
@@ -122,7 +129,8 @@ public:
     TAV::Mutex entityMutex;
     std::vector<IpmiEntity> entities;  // flat entity list, pre-order
     TAV::Mutex fruMutex;
-    std::vector<std::shared_ptr<IpmiFru>> frus;
+    std::vector<std::shared_ptr<IpmiFru>> frus;  // replaced whole under cacheLock
+    ipmiifc_fru_state fruState{};
     TAV::Mutex selMutex;  // SEL state, records and handler list
     std::shared_ptr<IpmiSel> sel;
     std::vector<std::shared_ptr<IpmiSelData>> selRecords;

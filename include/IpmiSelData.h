@@ -32,6 +32,53 @@ enum {
     SEL_EVENT_TYPE_MASK = 0x7F
 };
 
+// One SEL record as the library hands it to callers: the 16 bytes read from
+// the controller and the node they came from. Immutable once built, so any
+// thread may read it while the polling loop goes on.
+class TAV_IPMI_API IpmiSelData {
+public:
+    IpmiSelData(sel_event_record* record, int node);
+
+    uint16_t recordId() const;
+    uint8_t recordType() const;
+    // Types 0x00 and 0x02 are both taken as system event records.
+    bool isSelEventRecord() const;
+    // Bytes 7-8 for an event record, else 0.
+    uint16_t getGeneratorId() const;
+    // Seconds for event and timestamped OEM records; 0xFFFFFFFF otherwise.
+    uint32_t messageTimeStamp() const;
+    // Event/reading type of an event record, else 0xFFFFFFFF.
+    uint32_t eventType() const;
+    // CIM PerceivedSeverity of a threshold event: 5, 6, 7, or 0 for anything else.
+    int severity() const;
+    // CIM AlertType: 6 environmental, 8 security, 5 device, 0 OEM or not an event.
+    int alertType() const;
+    // Names and types of the values recordDataString() gives ("*type name*...").
+    std::string messageFormat() const;
+    // "Assert + " or "Deassert + ", the sensor type name and the event text.
+    std::string caption() const;
+    std::string description() const;
+    // The sensor number when the sensor cache knows a sensor of that number on
+    // an ordinary entity; 0 otherwise. May refresh the SDR cache when it is empty.
+    uint8_t getSensorNumber() const;
+    // "Invalid" for 0, else n with at least four digits ("0007").
+    std::string recordId(int n) const;
+    // The record's values in messageFormat() order, '*'-separated.
+    std::string recordDataString() const;
+    // Sends Storage command 0x46 without data and keeps bytes 2-3 of the
+    // answer in reservationId; returns the completion code (1 for 0xC1/0xCD).
+    int reserve(uint16_t& reservationId) const;
+    // Deletes this record on the controller; returns the completion code.
+    int clear() const;
+
+    const sel_event_record& record() const { return record_; }
+    int node() const { return node_; }
+
+private:
+    sel_event_record record_;
+    int node_;
+};
+
 // One line describing the event: direction, sensor type name and event text,
 // cut to `size` bytes including the terminating zero.
 TAV_IPMI_API void build_sel_desc(Event_log record, char* dst, int size);

@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # A real Prometheus scrapes `tavipmi serve --simulate` on loopback: the series
 # it ingests carry the readings the tool's JSON shows, scrapes cause no
-# exchange with the controller, and SIGTERM stops the tool cleanly. Reports
+# exchange with the controller, an event added to the simulated SEL is
+# counted once, and SIGTERM stops the tool cleanly. Reports
 # itself skipped when Debian's prometheus cannot be installed.
 # Usage: scripts/prometheus-test.sh [BUILD_DIR]
 set -euo pipefail
@@ -108,6 +109,23 @@ scraped=$(($(scrapes) - scraped_before))
 [ "$first" = "$second" ] || fail "scrapes caused exchanges: $(diff <(echo "$first") <(echo "$second") || true)"
 [ "$scraped" -gt 0 ] || fail "prometheus did not scrape meanwhile"
 echo "prometheus test: 5 direct scrapes and $scraped by Prometheus caused no exchange"
+
+# One event added to the simulated SEL shows as one more count, once the
+# polling loop (a pass every 16 s) has handed it over and Prometheus scraped.
+value() {
+  query "$1" | python3 -c 'import json,sys; r=json.load(sys.stdin)["data"]["result"]; print(int(float(r[0]["value"][1])) if r else -1)'
+}
+events_before=$(value 'sum(tavipmi_sel_events_total)')
+entries_before=$(value 'tavipmi_sel_entries')
+[ "$events_before" -ge 0 ] && [ "$entries_before" -ge 0 ] || fail "no SEL series"
+kill -USR1 "$serve_pid"
+one_more() { [ "$(value 'sum(tavipmi_sel_events_total)')" -eq $((events_before + 1)) ]; }
+retry 60 one_more || fail "the added SEL event was not counted once ($(value 'sum(tavipmi_sel_events_total)') after $events_before)"
+sleep 2
+[ "$(value 'sum(tavipmi_sel_events_total)')" -eq $((events_before + 1)) ] || fail "the SEL event was counted twice"
+[ "$(value 'tavipmi_sel_entries')" -eq $((entries_before + 1)) ] || fail "SEL entries did not grow by one"
+[ "$(value 'tavipmi_sel_events_total{severity="critical"}')" -ge 1 ] || fail "the upper critical event is not counted as critical"
+echo "prometheus test: one SEL event added, one more count (critical) and one more entry"
 
 kill -TERM "$serve_pid"
 wait "$serve_pid" || fail "serve exited with status $? on SIGTERM"

@@ -78,6 +78,19 @@ void registerSelHandlers(Bmc& bmc);
 void registerLanHandlers(Bmc& bmc);
 void registerFruHandlers(Bmc& bmc);
 
+// The controller's SEL clock (host time plus the offset Set SEL Time left).
+uint32_t selClock(const Bmc& bmc);
+// Logs a record as Add SEL Entry would: the next record ID and, for records
+// with a time stamp, the SEL clock unless `keepTimestamp`. Returns the record
+// ID, or 0 when the log is full (the overflow flag is then set).
+uint16_t addSelRecord(Bmc& bmc, const uint8_t record[16], bool keepTimestamp = false);
+// Empties the log and stamps the erase time.
+void clearSelRecords(Bmc& bmc);
+// Appends the records of a SEL file (16-byte records back to back) as they
+// are, IDs and time stamps included.
+// Throws std::runtime_error("file: message") when it cannot be read or is cut short.
+void loadSelDump(Bmc& bmc, const std::string& path);
+
 // Builds a controller from an ipmi_sim emulator command file.
 // Throws std::runtime_error("file:line: message") on a syntax error.
 std::shared_ptr<Bmc> loadProfile(const std::string& path);
@@ -87,6 +100,9 @@ std::string defaultProfilePath();
 // back, 5-byte header + body) to the controller's SDR repository.
 // Throws std::runtime_error("file: message") when it cannot be read or is cut short.
 void loadSdrDump(Bmc& bmc, const std::string& path);
+// Serves a raw FRU image file (offset 0 = common header) as FRU device `deviceId`.
+// Throws std::runtime_error("file: message") when it cannot be read.
+void loadFruImage(Bmc& bmc, uint8_t deviceId, const std::string& path);
 
 }  // namespace Sim
 

@@ -54,17 +54,28 @@ struct SensorModel {
     uint16_t rearmedDeassert = 0;
 };
 
+// System event log: 16-byte records in log order. Record IDs start at 1 and
+// start again at 1 after a clear, as many controllers do.
 struct SelModel {
     uint8_t version = 0x51;
+    // Entry count reported while `records` is empty (tests that move the
+    // count without building records).
     uint16_t entries = 0;
-    uint16_t freeSpace = 0x4000;
     uint32_t additionTimestamp = 0;
     uint32_t eraseTimestamp = 0;
-    uint8_t operationSupport = 0x0F;
-    std::vector<std::vector<uint8_t>> records;  // 16-byte SEL records
+    uint8_t operationSupport = 0x0F;  // delete, partial add, reserve, allocation info
+    std::vector<std::vector<uint8_t>> records;
     bool enabled = true;
-    uint16_t allocationUnits = 1024;
+    uint16_t allocationUnits = 1024;  // capacity in records: one unit holds one record
     uint16_t allocationUnitSize = 16;
+    bool overflow = false;            // an addition found the log full
+    uint16_t reservation = 0;         // 0: none granted
+    uint16_t nextRecordId = 1;
+    int64_t clockOffset = 0;          // SEL clock minus the host's (Set SEL Time)
+    uint16_t lastProcessedBySoftware = 0xFFFF;
+    uint16_t lastProcessedByBmc = 0xFFFF;
+    // Log a "log area reset/cleared" event after an erase, as many controllers do.
+    bool logsClearEvent = false;
 };
 
 struct LanChannelModel {
@@ -98,6 +109,9 @@ struct LanModel {
 
 struct FruDeviceModel {
     std::vector<uint8_t> data;
+    bool wordAccess = false;  // offsets and counts in 16-bit words
+    // Largest count in bytes one Read FRU Data answers; asking more gives 0xCA.
+    uint8_t maxReadBytes = 32;
 };
 
 struct FruModel {

@@ -1,9 +1,12 @@
 // LD_PRELOAD entry: other programs (ipmitool, FreeIPMI) see the simulated
 // controller named by TAV_IPMI_SIM_PROFILE ("default" for the project's own).
-// TAV_IPMI_SIM_VIRTUAL_TIME=1 makes their sleeps and time-outs virtual.
-// TAV_IPMI_SIM_CONTROL=1 lets a test steer a running program's simulator by
-// signals: SIGUSR1 adds an event to the SEL, SIGUSR2 prints the exchanges so
-// far per command on stderr.
+// A raw FRU image (a name ending in ".bin") is served as FRU device 0 of
+// the default controller. TAV_IPMI_SIM_COUNTS=FILE writes, at exit, how many
+// requests of each command the controller answered ("netfn cmd count" lines,
+// hexadecimal netfn and cmd). TAV_IPMI_SIM_VIRTUAL_TIME=1 makes their sleeps
+// and time-outs virtual. TAV_IPMI_SIM_CONTROL=1 lets a test steer a running
+// program's simulator by signals: SIGUSR1 adds an event to the SEL, SIGUSR2
+// prints the exchanges so far per command on stderr.
 
 #include <pthread.h>
 #include <signal.h>
@@ -21,40 +24,34 @@
 // Tells the interposer that it lives in the preload library.
 extern "C" const int tavIpmiSimPreloaded = 1;
 
+// Lets a program running on the simulator (the tool's watch demo) log a SEL
+// record as the controller's own sensors would. Returns the record ID, 0 when
+// the log is full or no controller is installed.
+extern "C" __attribute__((visibility("default"))) int tavIpmiSimAddSelEvent(const unsigned char* record) {
+    int id = 0;
+    Sim::Simulator::instance().withBmc([&](Sim::Bmc& b) { id = Sim::addSelRecord(b, record); });
+    return id;
+}
+
 namespace {
 
 // A temperature sensor's upper critical threshold crossed going high.
 void addSelEvent(Sim::Bmc& b) {
-    const uint16_t id = static_cast<uint16_t>(b.sel.records.size() + 1);
-    const uint32_t now = static_cast<uint32_t>(time(nullptr));
-    std::vector<uint8_t> r = {static_cast<uint8_t>(id & 0xFF),
-                              static_cast<uint8_t>(id >> 8),
-                              0x02,  // system event record
-                              static_cast<uint8_t>(now),
-                              static_cast<uint8_t>(now >> 8),
-                              static_cast<uint8_t>(now >> 16),
-                              static_cast<uint8_t>(now >> 24),
-                              0x20,
-                              0x00,  // generator: the BMC
-                              0x04,  // event message revision
-                              0x01,  // temperature
-                              0x01,  // sensor number
-                              0x01,  // threshold, assertion
-                              0x59,  // upper critical going high, with trigger reading and threshold
-                              0x30,
-                              0x2F};
-    b.sel.records.push_back(r);
-    b.sel.additionTimestamp = now;
+    const uint8_t record[16] = {0, 0,  // record ID: the log assigns it
+                                0x02,  // system event record
+                                0, 0, 0, 0,  // time stamp: the log's clock
+                                0x20, 0x00,  // generator: the BMC
+                                0x04,        // event message revision
+                                0x01,        // temperature
+                                0x01,        // sensor number
+                                0x01,        // threshold, assertion
+                                0x59,        // upper critical going high, with trigger reading and threshold
+                                0x30, 0x2F};
+    Sim::addSelRecord(b, record);
 }
 
-void printCounters() {
-    unsigned total = 0;
-    for (const auto& c : Sim::Simulator::instance().counters()) {
-        fprintf(stderr, "tav-ipmi simulator: exchanges netfn 0x%02x cmd 0x%02x: %u\n", c.first >> 8, c.first & 0xFF,
-                c.second);
-        total += c.second;
-    }
-    fprintf(stderr, "tav-ipmi simulator: exchanges total: %u\n", total);
+void printCounters(FILE* out, const char* format) {
+    for (const auto& c : Sim::Simulator::instance().counters()) fprintf(out, format, c.first >> 8, c.first & 0xFF, c.second);
 }
 
 void* controlThread(void* arg) {
@@ -63,7 +60,10 @@ void* controlThread(void* arg) {
         int sig = 0;
         if (sigwait(signals, &sig) != 0) continue;
         if (sig == SIGUSR1) Sim::Simulator::instance().withBmc(addSelEvent);
-        if (sig == SIGUSR2) printCounters();
+        if (sig == SIGUSR2) {
+            printCounters(stderr, "tav-ipmi simulator: exchanges netfn 0x%02x cmd 0x%02x: %u\n");
+            fprintf(stderr, "tav-ipmi simulator: exchanges total: %u\n", Sim::Simulator::instance().totalExchanges());
+        }
     }
     return nullptr;
 }
@@ -83,10 +83,14 @@ void startControl() {
 __attribute__((constructor)) void installFromEnvironment() {
     const char* profile = getenv("TAV_IPMI_SIM_PROFILE");
     if (profile == nullptr || *profile == '\0') return;
-    std::string path = strcmp(profile, "default") == 0 ? Sim::defaultProfilePath() : std::string(profile);
+    const std::string name(profile);
+    const bool fruImage = name.size() > 4 && name.compare(name.size() - 4, 4, ".bin") == 0;
+    std::string path = name == "default" || fruImage ? Sim::defaultProfilePath() : name;
     try {
         const char* vt = getenv("TAV_IPMI_SIM_VIRTUAL_TIME");
-        Sim::Simulator::instance().install(Sim::loadProfile(path), vt != nullptr && strcmp(vt, "1") == 0);
+        auto bmc = Sim::loadProfile(path);
+        if (fruImage) Sim::loadFruImage(*bmc, 0, name);
+        Sim::Simulator::instance().install(bmc, vt != nullptr && strcmp(vt, "1") == 0);
     } catch (const std::exception& e) {
         // Without its controller the program would reach for the real
         // device and report that instead: stop here with the one reason.
@@ -95,6 +99,15 @@ __attribute__((constructor)) void installFromEnvironment() {
     }
     const char* control = getenv("TAV_IPMI_SIM_CONTROL");
     if (control != nullptr && strcmp(control, "1") == 0) startControl();
+}
+
+__attribute__((destructor)) void reportCounts() {
+    const char* path = getenv("TAV_IPMI_SIM_COUNTS");
+    if (path == nullptr || *path == '\0' || !Sim::Simulator::instance().installed()) return;
+    FILE* out = fopen(path, "w");
+    if (out == nullptr) return;
+    printCounters(out, "%02x %02x %u\n");
+    fclose(out);
 }
 
 }  // namespace

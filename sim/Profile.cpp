@@ -51,6 +51,7 @@ constexpr uint8_t kEventMessagesEnabled = 0x80;
 constexpr uint8_t kScanningEnabled = 0x40;
 constexpr uint32_t kMaxManufacturerId = 0xFFFFF;  // 20 bits
 constexpr uint32_t kMaxFruSize = 0xFFFF;
+constexpr size_t kSelAddBytes = 13;  // a SEL record after its ID and type
 
 // Threshold access and hysteresis support codes of the SDR capabilities byte.
 const std::map<std::string, uint8_t> kSupportNames = {{"none", 0}, {"readable", 1}, {"settable", 2}, {"fixed", 3}};
@@ -62,7 +63,7 @@ const std::map<std::string, uint8_t> kEventSupportNames = {
 const std::set<std::string> kSkippedCommands = {
     "quit",         "sleep",           "debug",         "read_cmds",       "set_working_mc",
     "mc_set_guid",  "mc_dump_fru_data", "mc_set_power", "mc_set_num_leds", "mc_new_event",
-    "sel_add",      "device_sdr_add",  "atca_enable",   "atca_set_site"};
+    "device_sdr_add",  "atca_enable",   "atca_set_site"};
 
 struct Command {
     std::string file;
@@ -134,6 +135,7 @@ private:
     void mcAdd(const Command& c);
     void mcAddFruData(const Command& c);
     void selEnable(const Command& c);
+    void selAdd(const Command& c);
     void mainSdrAdd(const Command& c);
     void sensorAdd(const Command& c);
     void sensorSetValue(const Command& c);
@@ -341,6 +343,7 @@ void ProfileReader::run(const Command& c) {
     }
     if (name == "mc_add_fru_data") return mcAddFruData(c);
     if (name == "sel_enable") return selEnable(c);
+    if (name == "sel_add") return selAdd(c);
     if (name == "main_sdr_add") return mainSdrAdd(c);
     if (name == "sensor_add") return sensorAdd(c);
     if (name == "sensor_set_value") return sensorSetValue(c);
@@ -416,7 +419,18 @@ void ProfileReader::selEnable(const Command& c) {
     sel.enabled = true;
     sel.operationSupport = flags;
     sel.allocationUnits = maxEntries;
-    sel.freeSpace = static_cast<uint16_t>(std::min<uint32_t>(0xFFFFu, uint32_t(maxEntries) * sel.allocationUnitSize));
+}
+
+// A record given with a time stamp keeps it; one with 0 gets the SEL clock.
+void ProfileReader::selAdd(const Command& c) {
+    needArgs(c, 3 + kSelAddBytes, "sel_add mc record-type byte1 ... byte13");
+    uint8_t addr = controller(c, 1);
+    uint8_t record[16] = {};
+    record[2] = byte(c, 2, "SEL record type");
+    for (size_t i = 0; i < kSelAddBytes; ++i) record[3 + i] = byte(c, 3 + i, "SEL record byte");
+    if (addr != kBmcAddress) return;
+    const bool stamped = record[3] | record[4] | record[5] | record[6];
+    if (addSelRecord(bmc_, record, stamped) == 0) throw SyntaxError(c, "the SEL is full");
 }
 
 void ProfileReader::mainSdrAdd(const Command& c) {
@@ -563,6 +577,10 @@ std::shared_ptr<Bmc> loadProfile(const std::string& path) {
     auto bmc = std::make_shared<Bmc>();
     if (endsWith(path, ".sdr")) {
         loadSdrDump(*bmc, path);
+        return bmc;
+    }
+    if (endsWith(path, ".sel")) {  // a controller whose SEL holds these records
+        loadSelDump(*bmc, path);
         return bmc;
     }
     // A profile has a SEL only if it enables one.

@@ -130,6 +130,9 @@ public:
     bool installed() const;
     std::shared_ptr<Bmc> bmc() const;
     VirtualClock& clock() { return clock_; }
+    // Runs `change` on the controller under the lock that answers take, so
+    // another thread may change the model while the library talks to it.
+    void withBmc(const std::function<void(Bmc&)>& change);
 
     // Faults, in front of the controller's command table.
     void addFault(int netfn, int cmd, const Fault& fault);
@@ -143,9 +146,6 @@ public:
     // Exchanges per command, keyed by netfn << 8 | cmd.
     std::map<uint16_t, unsigned> counters() const;
     void resetCounters();
-    // Changes the controller's model between exchanges (a running program's
-    // simulator, changed from outside).
-    void withBmc(const std::function<void(Bmc&)>& change);
 
     // Real time each answer takes (benchmarks); 0 answers at once.
     void setLatencyUs(int64_t us) { latencyUs_.store(us); }

@@ -68,6 +68,11 @@ std::shared_ptr<Bmc> Simulator::bmc() const {
     return bmc_;
 }
 
+void Simulator::withBmc(const std::function<void(Bmc&)>& change) {
+    std::lock_guard<std::mutex> guard(mutex_);
+    if (bmc_) change(*bmc_);
+}
+
 void Simulator::addFault(int netfn, int cmd, const Fault& fault) {
     std::lock_guard<std::mutex> guard(mutex_);
     faults_.push_back(FaultRule{netfn, cmd, fault});
@@ -100,11 +105,6 @@ std::vector<Request> Simulator::requests() const {
 std::map<uint16_t, unsigned> Simulator::counters() const {
     std::lock_guard<std::mutex> guard(mutex_);
     return counters_;
-}
-
-void Simulator::withBmc(const std::function<void(Bmc&)>& change) {
-    std::lock_guard<std::mutex> guard(mutex_);
-    if (bmc_) change(*bmc_);
 }
 
 void Simulator::resetCounters() {

@@ -165,6 +165,7 @@ TEST_F(PollLoop, SelInfoFailuresAreRetried) {
 TEST_F(PollLoop, SelInfoAnswersAreStored) {
     ASSERT_GE(IpmiIfcOpenIpmiOpen(0), 0);
     bmc().sel.entries = 300;
+    bmc().sel.additionTimestamp = 1000;  // a log that never changed is not stored
     uint16_t count = 0;
     ASSERT_EQ(IpmiIfcSelGetInfo(0, &count), 0u);
     EXPECT_EQ(count, 44);  // the low byte only

@@ -12,6 +12,7 @@
 #include <nlohmann/json.hpp>
 
 #include "PeerTools.h"
+#include "TestSupport.h"
 
 #ifdef TAV_IPMI_TOOL
 
@@ -36,13 +37,30 @@ TEST(Tool, ViewsShowTheSimulatedServer) {
         {"sensors", {"  PS1 Input Power | 64  | 10.1   | Other                  | 232 Watts    | ok                | na  "
                      "| na     | na     | 600    | 660    | na  | OK"}},
         {"entities", {"  System Chassis (23.1)", "    Power Supply (10.2)"}},
+        {"sel", {"  6  | 2025-11-25 12:33:18 | DIMM A 3 #0x62      | Assert + Memory Correctable ECC                        "
+                 "| none     | Correctable ECC"}},
+        {"watch", {"Watching the system event log (Ctrl-C ends)",
+                   " | Inlet Temp #0x01     | Deassert + Temperature Upper Non-critical going high | major    | Upper "
+                   "Non-critical going high"}},
+        {"fru", {"  Name                  : PS1", "  PSU capacity (W)      : 550"}},
     };
     for (const auto& v : views) {
         SCOPED_TRACE(v.view);
-        ToolRun run = tavipmi({v.view});
+        // The watch ends after two records that its demo logs on the simulator.
+        ToolRun run = v.view == std::string("watch") ? tavipmi({"watch", "--demo", "--count", "2"}) : tavipmi({v.view});
         EXPECT_EQ(run.exitCode, 0) << run.err;
         for (const auto& line : v.lines) EXPECT_NE(run.out.find(line + "\n"), std::string::npos) << run.out;
     }
+}
+
+TEST(Tool, AFruImageFileIsServedAsDeviceZero) {
+    const std::string image = TestSupport::realDataPath("fru/infrasim_s2600wtt_fru2.bin");
+    if (image.empty()) GTEST_SKIP() << "real server data not present";
+    ToolRun run = TestSupport::runTool(image, TAV_IPMI_TOOL, {"fru"});
+    EXPECT_EQ(run.exitCode, 0) << run.err;
+    EXPECT_NE(run.out.find("  Device ID             : 0\n  Name                  : System Board\n"), std::string::npos)
+        << run.out;
+    EXPECT_NE(run.out.find("  Product manufacturer  : DELTA\n"), std::string::npos) << run.out;
 }
 
 // JSON carries numbers and nulls; CSV the same records under a header row.

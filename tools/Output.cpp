@@ -71,7 +71,8 @@ void renderFields(const Section& s, FILE* out) {
         if (!first) fprintf(out, "\n");
         first = false;
         for (const Column* c : cols)
-            fprintf(out, "  %-*s : %s\n", static_cast<int>(width), c->label.c_str(),
+            if (!s.omitMissing || !member(r, c->key).is_null())
+                fprintf(out, "  %-*s : %s\n", static_cast<int>(width), c->label.c_str(),
                     cellText(member(r, c->key)).c_str());
     }
 }
@@ -109,20 +110,30 @@ void renderCsv(const std::vector<Section>& sections, FILE* out) {
     for (const auto& s : sections) {
         if (!first) fprintf(out, "\n");
         first = false;
-        const auto cols = columnsFor(s, Format::Csv);
-        std::string header;
-        for (const Column* c : cols) header += (header.empty() ? "" : ",") + csvField(c->key);
-        fprintf(out, "%s\n", header.c_str());
-        for (const auto& r : s.records) {
-            std::string line;
-            for (size_t i = 0; i < cols.size(); ++i)
-                line += (i ? "," : "") + csvField(cellText(member(r, cols[i]->key)));
-            fprintf(out, "%s\n", line.c_str());
-        }
+        fprintf(out, "%s\n", csvHeader(s.columns).c_str());
+        for (const auto& r : s.records) fprintf(out, "%s\n", csvRow(s.columns, r).c_str());
     }
 }
 
 }  // namespace
+
+std::string csvHeader(const std::vector<Column>& columns) {
+    std::string line;
+    for (const auto& c : columns)
+        if (c.use != Column::TableOnly) line += (line.empty() ? "" : ",") + csvField(c.key);
+    return line;
+}
+
+std::string csvRow(const std::vector<Column>& columns, const Json& record) {
+    std::string line;
+    bool first = true;
+    for (const auto& c : columns) {
+        if (c.use == Column::TableOnly) continue;
+        line += (first ? "" : ",") + csvField(cellText(member(record, c.key)));
+        first = false;
+    }
+    return line;
+}
 
 std::string cellText(const Json& v) {
     if (v.is_null()) return kNoValue;

@@ -34,6 +34,8 @@ struct Section {
     enum Layout { Columns, Fields } layout = Columns;
     // JSON gives a lone record as an object rather than a one-element array.
     bool single = false;
+    // Fields: leave out the fields a record does not have.
+    bool omitMissing = false;
     std::vector<Column> columns;
     std::vector<Json> records;  // members named by the columns' keys; absent or null: no value
 };
@@ -41,6 +43,10 @@ struct Section {
 // A value as a table or CSV shows it: numbers without needless decimals,
 // lists joined with ", ", null as kNoValue.
 std::string cellText(const Json& value);
+
+// CSV lines, for output that is printed record by record.
+std::string csvHeader(const std::vector<Column>& columns);
+std::string csvRow(const std::vector<Column>& columns, const Json& record);
 
 void render(const std::vector<Section>& sections, Format format, FILE* out);
 

@@ -18,7 +18,9 @@
 #include "CmpiStatus.h"
 #include "Identity.h"
 #include "IpmiIfc.h"
+#include "IpmiSelData.h"
 #include "Metrics.h"
+#include "SelFacts.h"
 #include "Views.h"
 
 namespace {
@@ -56,6 +58,11 @@ void runLoop() {
         fprintf(stderr, "tavipmi: the polling loop stopped: %s\n", e.what());
         loopReported = true;
     }
+}
+
+// Exactly once per record: the loop hands each new record over once.
+void countEvent(void*, Ipmi::IpmiSelData* record) {
+    if (record != nullptr) Tool::countSelEvent(*record);
 }
 
 int serve(std::vector<Tool::Section>&) {
@@ -102,6 +109,8 @@ int serve(std::vector<Tool::Section>&) {
         if (!loopReported) fprintf(stderr, "tavipmi: cannot open /dev/ipmi0\n");
         return 1;
     }
+    // start() clears the handler list: the count starts once the loop runs.
+    Ipmi::IpmiIfc::registerSelEventHandler(countEvent, nullptr);
     std::thread http([&server] { server.listen_after_bind(); });
     fprintf(stderr, "tavipmi: serving metrics on http://%s:%d/metrics\n",
             host.find(':') == std::string::npos ? host.c_str() : ("[" + host + "]").c_str(), port);
@@ -120,6 +129,10 @@ int serve(std::vector<Tool::Section>&) {
 int metrics(std::vector<Tool::Section>&) {
     if (!Tool::readIdentity()) return 1;
     if (Ipmi::IpmiIfcSdrGetInfo(0) != 0) fprintf(stderr, "tavipmi: could not read the SDR repository\n");
+    Ipmi::IpmiIfcFruInstantiateAll(0);
+    // Without a loop handing records over, the count is of the records held.
+    if (Ipmi::IpmiIfcSelGetInfo(0, nullptr) == 0)
+        for (const auto& r : Ipmi::IpmiIfc::getSelData(0)) Tool::countSelEvent(*r);
     fputs(Tool::metricsText().c_str(), stdout);
     return 0;
 }

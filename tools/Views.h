@@ -36,6 +36,9 @@ struct ViewRegistrar {
     ViewRegistrar(const std::string& name, View view) { views()[name] = std::move(view); }
 };
 
+// The format chosen with --format, for views that print as they go.
+Format outputFormat();
+
 // The health rules next to an installed or build-tree tool, when /etc has none.
 void loadHealthRules();
 

@@ -20,6 +20,9 @@
 #include "Views.h"
 
 namespace Tool {
+Format chosenFormat = Format::Table;
+Format outputFormat() { return chosenFormat; }
+
 std::map<std::string, View>& views() {
     static std::map<std::string, View> all;
     return all;
@@ -135,7 +138,8 @@ int main(int argc, char** argv) {
     app.set_version_flag("--version", std::string("tavipmi (tav-ipmi) ") + TAV_IPMI_VERSION);
     std::string profile;
     app.add_option("--simulate", profile,
-                   "talk to the simulated BMC: its default server, or an ipmi_sim .emu / raw .sdr file")
+                   "talk to the simulated BMC: its default server, an ipmi_sim .emu, raw .sdr or SEL file, "
+                   "or the default server with a raw FRU image (.bin) as FRU device 0")
         ->expected(0, 1)
         ->default_str("default");
     Tool::Format format = Tool::Format::Table;
@@ -166,6 +170,7 @@ int main(int argc, char** argv) {
     if (app.count("--simulate") && getenv("TAVIPMI_SIMULATED") == nullptr)
         return reexecSimulated(argv, profile.empty() ? "default" : profile);
 
+    Tool::chosenFormat = format;
     std::vector<std::string> selected;
     for (CLI::App* sub : app.get_subcommands()) selected.push_back(byCommand[sub]);
     if (selected.empty()) selected = defaultViews();

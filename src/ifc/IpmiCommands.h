@@ -47,8 +47,11 @@ constexpr uint8_t getSelInfo = 0x40;
 constexpr uint8_t getSelAllocationInfo = 0x41;
 constexpr uint8_t reserveSel = 0x42;
 constexpr uint8_t getSelEntry = 0x43;
+constexpr uint8_t addSelEntry = 0x44;
+constexpr uint8_t deleteSelEntry = 0x46;
 constexpr uint8_t clearSel = 0x47;
 constexpr uint8_t getSelTime = 0x48;
+constexpr uint8_t setSelTime = 0x49;
 // Transport
 constexpr uint8_t getLanConfigParameters = 0x02;
 }  // namespace cmd

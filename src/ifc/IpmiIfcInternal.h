@@ -168,7 +168,14 @@ int IpmiIfcRhSelGetAllocInfo(ipmiifc_resp* resp);
 void IpmiIfcSelCleanUpEventHandlers(int node);
 
 // FRU inventory.
+extern int fru_max_req_size;
 int IpmiIfcFruInstantiateAll(int node);
+int IpmiIfcRhFruInv(ipmiifc_resp* resp, uint8_t deviceId);
+unsigned int IpmiIfcReadFru(int node, unsigned char deviceId, unsigned char wordAccess, int offset,
+                            unsigned int* length, unsigned char* buffer);
+unsigned int IpmiIfruInfoAreaLength(int node, unsigned char deviceId, unsigned char wordAccess, unsigned int offset);
+bool IpmiIfcFruChecksum(unsigned char* data, unsigned char* sum, unsigned int length);
+unsigned int IpmiIfcFruMultiLength(int node, unsigned char deviceId, unsigned int offset);
 
 }  // namespace Ipmi
 

@@ -17,6 +17,7 @@
 #include <vector>
 
 #include "IpmiIfcInternal.h"
+#include "IpmiIfcSel.h"
 #include "IpmiLan.h"
 #include "IpmiMapper.h"
 
@@ -91,18 +92,11 @@ void rethrowIfUnwinding() {
     }
 }
 
-// Calls every registered handler once without a record. The list is copied
-// under its mutex and walked without it, so a handler may (un)register.
-// A handler that throws ends the walk for this pass.
-void callHandlersWithoutRecord(IpmiNode& n) {
-    std::vector<ipmiifc_sel_handler> entries;
-    {
-        TAV::MutexLock guard(n.selMutex);
-        for (ipmiifc_sel_handler* e = n.work.sel_handlers; e; e = e->next)
-            if (e->handler) entries.push_back(*e);
-    }
+// Calls every registered handler once without a record, on the live list
+// (see IpmiIfcSelCallHandlers). A handler that throws ends the walk for this pass.
+void callHandlersWithoutRecord() {
     try {
-        for (const auto& e : entries) e.handler(e.context, nullptr);
+        IpmiIfcSelCallHandlers(nullptr);
     } catch (const kelInt::CmpiStatus& s) {
         ipmiLog(LOG_DEBUG, "Event handler ran into issues: %s(%d)", s.msg(), static_cast<int>(s.rc()));
     } catch (...) {
@@ -200,7 +194,7 @@ PassEnd runPass(IpmiNode& n, LoopState& s) {
         IpmiIfcSensorUpdateReading(0);
     }
 
-    callHandlersWithoutRecord(n);
+    callHandlersWithoutRecord();
 
     if (s.fullRefresh) {
         refreshFru();

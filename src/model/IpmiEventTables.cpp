@@ -585,6 +585,47 @@ constexpr std::array<ipmi_event_type, N + 1> eventTypesOf(uint32_t category) {
 constexpr auto kGenericEventTypes = eventTypesOf<countTexts(SEL_KEY_GENERIC)>(SEL_KEY_GENERIC);
 constexpr auto kSpecificEventTypes = eventTypesOf<countTexts(SEL_KEY_SPECIFIC)>(SEL_KEY_SPECIFIC);
 
+// ---- Caption tables: every row, reshaped -------------------------------------
+
+constexpr size_t countRows(uint32_t category) {
+    size_t n = 0;
+    for (const ipmi_sel_row& row : ipmi_sel_data)
+        if (selKeyCategory(row.key) == selKeyCategory(category)) ++n;
+    return n;
+}
+
+constexpr char kCaptionReserved[] = "Reserved";
+constexpr char kCaptionOem[] = "OEM";
+constexpr uint8_t kFruHotSwapType = 0xF0;
+constexpr uint8_t kOemSensorType = 0xC0;
+
+// The sensor-specific table opens with a "Reserved" row for sensor type 0 and
+// closes with an "OEM" row for 0xC0. Its FRU Hot Swap "Transition to M7" row
+// sits under offset 6, behind M6, so a first-match search never shows it and
+// offset 7 has no row: captions have always read that way.
+template <size_t N>
+constexpr std::array<ipmi_caption_row, N + 1> captionRowsOf(uint32_t category) {
+    std::array<ipmi_caption_row, N + 1> out{};
+    const bool specificRows = selKeyCategory(category) == selKeyCategory(SEL_KEY_SPECIFIC);
+    size_t n = 0;
+    if (specificRows) out[n++] = {0x00, 0x00, SEL_KEY_ANY_DATA3, 0, kCaptionReserved, nullptr};
+    for (const ipmi_sel_row& row : ipmi_sel_data) {
+        if (selKeyCategory(row.key) != selKeyCategory(category)) continue;
+        const uint8_t code = selKeyType(row.key);
+        uint8_t offset = selKeyData1(row.key);
+        if (specificRows && code == kFruHotSwapType && offset == 7) offset = 6;
+        const uint8_t cls = specificRows ? 0 : (code == EVENT_TYPE_THRESHOLD ? 2 : 1);
+        out[n++] = {code, offset, selKeyData3(row.key), cls, row.group, row.desc};
+    }
+    if (specificRows) out[n++] = {kOemSensorType, 0x00, SEL_KEY_ANY_DATA3, 0, kCaptionOem, nullptr};
+    return out;  // the last row stays zero: no group ends the table
+}
+
+constexpr auto kGenericCaptionRows = captionRowsOf<countRows(SEL_KEY_GENERIC)>(SEL_KEY_GENERIC);
+constexpr auto kSpecificCaptionRows = captionRowsOf<countRows(SEL_KEY_SPECIFIC) + 2>(SEL_KEY_SPECIFIC);
+static_assert(kGenericCaptionRows.size() == GENERIC_EVENT_TYPE_ROWS + 1, "generic caption rows");
+static_assert(kSpecificCaptionRows.size() == SENSOR_SPECIFIC_TYPE_ROWS + 1, "sensor-specific caption rows");
+
 // ---- SEL record description ------------------------------------------------
 
 constexpr char kNoDescription[] = "n/a";
@@ -623,6 +664,8 @@ const int32_t (&V_array)[IPMI_SEL_DATA_ROWS] = kHash.v;
 
 const ipmi_event_type* const generic_sensor_event_types = kGenericEventTypes.data();
 const ipmi_event_type* const sensor_specific_event_types = kSpecificEventTypes.data();
+const ipmi_caption_row* const generic_event_types = kGenericCaptionRows.data();
+const ipmi_caption_row* const sensor_specific_types = kSpecificCaptionRows.data();
 
 // The hash is minimal: every slot of V_array holds a row, so any key, listed or
 // not, names a row of the table.

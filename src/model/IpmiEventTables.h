@@ -121,6 +121,23 @@ struct ipmi_event_type {
 extern const ipmi_event_type* const generic_sensor_event_types;
 extern const ipmi_event_type* const sensor_specific_event_types;
 
+// The rows of ipmi_sel_data reshaped for SEL record captions, in table order.
+// Each table ends with a row whose group is null.
+struct ipmi_caption_row {
+    uint8_t code;    // event/reading type, or sensor type
+    uint8_t offset;  // event offset
+    uint8_t match;   // event data 3 the text is for; 0xFF any
+    uint8_t cls;     // reading class: 2 threshold, 1 discrete, 0 other
+    const char* group;
+    const char* desc;  // null for a sensor type without offsets
+};
+
+enum { GENERIC_EVENT_TYPE_ROWS = 61, SENSOR_SPECIFIC_TYPE_ROWS = 293 };
+
+extern const ipmi_caption_row* const generic_event_types;
+// Row 0 is sensor type 0 "Reserved" and the row before the end is 0xC0 "OEM".
+extern const ipmi_caption_row* const sensor_specific_types;
+
 }  // namespace Ipmi
 
 #endif

@@ -111,12 +111,16 @@ ToolRun runTool(const std::string& profile, const std::string& tool, const std::
 }
 
 ToolRun runIpmiSensors(const std::string& profile, const std::vector<std::string>& extraArgs) {
+    return runFreeIpmi(profile, "ipmi-sensors", extraArgs);
+}
+
+ToolRun runFreeIpmi(const std::string& profile, const std::string& program, const std::vector<std::string>& extraArgs) {
     char cache[] = "/tmp/tav-sdr-cache-XXXXXX";
     if (mkdtemp(cache) == nullptr) return ToolRun();
     std::vector<std::string> args{"--driver-type=OPENIPMI", std::string("--sdr-cache-directory=") + cache,
                                   "--quiet-cache"};
     args.insert(args.end(), extraArgs.begin(), extraArgs.end());
-    ToolRun run = runTool(profile, toolPath("ipmi-sensors"), args);
+    ToolRun run = runTool(profile, toolPath(program), args);
     nftw(
         cache, [](const char* p, const struct stat*, int, struct FTW*) { return remove(p); }, 16,
         FTW_DEPTH | FTW_PHYS);

@@ -25,6 +25,8 @@ std::string toolPath(const std::string& name);
 // virtual, so requests the controller leaves unanswered cost nothing.
 ToolRun runTool(const std::string& profile, const std::string& tool, const std::vector<std::string>& args);
 
+// A FreeIPMI program (e.g. "ipmi-sel") on the simulator with a fresh SDR cache of its own.
+ToolRun runFreeIpmi(const std::string& profile, const std::string& program, const std::vector<std::string>& extraArgs);
 // `ipmi-sensors` on the simulator with a fresh SDR cache of its own.
 ToolRun runIpmiSensors(const std::string& profile, const std::vector<std::string>& extraArgs = {});
 
