@@ -16,6 +16,7 @@
 
 #include <benchmark/benchmark.h>
 
+#include <chrono>
 #include <thread>
 
 #include "GeneratedServer.h"
@@ -46,6 +47,17 @@ void scrapeBesideLoop(benchmark::State& state, bool busyLoop) {
         loop.join();
         sim().uninstall();
         return;
+    }
+    // The loop's preamble (SEL, LAN, FRU discovery) runs once the loop is
+    // running: in real time, wait until the controller falls quiet.
+    if (!busyLoop) {
+        unsigned seen = sim().totalExchanges();
+        for (int i = 0; i < 50; ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(200));
+            const unsigned now = sim().totalExchanges();
+            if (now == seen) break;
+            seen = now;
+        }
     }
     const unsigned exchangesBefore = sim().totalExchanges();
     size_t bytes = 0;
