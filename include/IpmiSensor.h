@@ -95,6 +95,19 @@ public:
     void setReading(unsigned char* five_bytes);
     void setThresholdReading(unsigned char* eight_bytes);
     void getReadingTime(std::string& out) const;
+
+    // What the discovery and refresh passes left in the object, copied at
+    // once: safe from any thread while the polling loop refreshes the sensor,
+    // and it sends nothing.
+    struct CachedState {
+        unsigned char reading[5];     // the Get Sensor Reading answer, completion code first
+        unsigned char readingLength;  // valid bytes of `reading`
+        bool readingValid;
+        uint32_t lastPollResult;      // 0, a completion code, or -1 when nothing was sent
+        uint64_t readingTime;         // microseconds since the epoch; 0: never read
+        unsigned char thresholds[8];  // the Get Sensor Thresholds answer, completion code first
+    };
+    CachedState getCachedState() const;
     void dump() const;
 
     // Values in engineering units (full records only).

@@ -11,6 +11,11 @@ command -v make >/dev/null || need+=(make)
 [ -f /usr/include/benchmark/benchmark.h ] || need+=(libbenchmark-dev)
 [ -f /usr/include/linux/ipmi.h ] || need+=(linux-libc-dev)
 command -v pkg-config >/dev/null || need+=(pkg-config)
+# The tool: argument parsing, JSON output, the metrics endpoint.
+[ -f /usr/include/CLI/CLI.hpp ] || need+=(libcli11-dev)
+[ -f /usr/include/nlohmann/json.hpp ] || need+=(nlohmann-json3-dev)
+[ -f /usr/include/httplib.h ] || need+=(libcpp-httplib-dev)
+command -v curl >/dev/null || need+=(curl)
 # libFuzzer targets: clang and its sanitizer/fuzzer runtime, where the
 # distribution has them (the test script skips fuzzing without them).
 optional=()

@@ -25,6 +25,9 @@ ctest --test-dir build --output-on-failure -j"$jobs"
 echo "== install"
 scripts/install-test.sh build
 
+echo "== Prometheus scrapes the tool"
+scripts/prometheus-test.sh build
+
 echo "== benchmarks (short run)"
 for b in build/bench/*-bench; do
   [ -x "$b" ] && "$b" --benchmark_min_time=0.01

@@ -3,15 +3,20 @@
 // A raw FRU image (a name ending in ".bin") is served as FRU device 0 of
 // the default controller. TAV_IPMI_SIM_COUNTS=FILE writes, at exit, how many
 // requests of each command the controller answered ("netfn cmd count" lines,
-// hexadecimal netfn and cmd). TAV_IPMI_SIM_VIRTUAL_TIME=1 makes their sleeps and time-outs virtual.
+// hexadecimal netfn and cmd). TAV_IPMI_SIM_VIRTUAL_TIME=1 makes their sleeps
+// and time-outs virtual. TAV_IPMI_SIM_CONTROL=1 lets a test steer a running
+// program's simulator by signals: SIGUSR1 adds an event to the SEL, SIGUSR2
+// prints the exchanges so far per command on stderr.
 
+#include <pthread.h>
+#include <signal.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
+#include <time.h>
+#include <unistd.h>
 
 #include <exception>
-#include <map>
-#include <utility>
 
 #include "Bmc.h"
 #include "Sim.h"
@@ -30,6 +35,51 @@ extern "C" __attribute__((visibility("default"))) int tavIpmiSimAddSelEvent(cons
 
 namespace {
 
+// A temperature sensor's upper critical threshold crossed going high.
+void addSelEvent(Sim::Bmc& b) {
+    const uint8_t record[16] = {0, 0,  // record ID: the log assigns it
+                                0x02,  // system event record
+                                0, 0, 0, 0,  // time stamp: the log's clock
+                                0x20, 0x00,  // generator: the BMC
+                                0x04,        // event message revision
+                                0x01,        // temperature
+                                0x01,        // sensor number
+                                0x01,        // threshold, assertion
+                                0x59,        // upper critical going high, with trigger reading and threshold
+                                0x30, 0x2F};
+    Sim::addSelRecord(b, record);
+}
+
+void printCounters(FILE* out, const char* format) {
+    for (const auto& c : Sim::Simulator::instance().counters()) fprintf(out, format, c.first >> 8, c.first & 0xFF, c.second);
+}
+
+void* controlThread(void* arg) {
+    const sigset_t* signals = static_cast<const sigset_t*>(arg);
+    for (;;) {
+        int sig = 0;
+        if (sigwait(signals, &sig) != 0) continue;
+        if (sig == SIGUSR1) Sim::Simulator::instance().withBmc(addSelEvent);
+        if (sig == SIGUSR2) {
+            printCounters(stderr, "tav-ipmi simulator: exchanges netfn 0x%02x cmd 0x%02x: %u\n");
+            fprintf(stderr, "tav-ipmi simulator: exchanges total: %u\n", Sim::Simulator::instance().totalExchanges());
+        }
+    }
+    return nullptr;
+}
+
+// The signals are blocked before the program starts any thread of its own, so
+// every thread inherits the block and only the control thread takes them.
+void startControl() {
+    static sigset_t signals;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGUSR1);
+    sigaddset(&signals, SIGUSR2);
+    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+    pthread_t thread;
+    if (pthread_create(&thread, nullptr, controlThread, &signals) == 0) pthread_detach(thread);
+}
+
 __attribute__((constructor)) void installFromEnvironment() {
     const char* profile = getenv("TAV_IPMI_SIM_PROFILE");
     if (profile == nullptr || *profile == '\0') return;
@@ -42,18 +92,21 @@ __attribute__((constructor)) void installFromEnvironment() {
         if (fruImage) Sim::loadFruImage(*bmc, 0, name);
         Sim::Simulator::instance().install(bmc, vt != nullptr && strcmp(vt, "1") == 0);
     } catch (const std::exception& e) {
+        // Without its controller the program would reach for the real
+        // device and report that instead: stop here with the one reason.
         fprintf(stderr, "tav-ipmi simulator: %s\n", e.what());
+        _exit(2);
     }
+    const char* control = getenv("TAV_IPMI_SIM_CONTROL");
+    if (control != nullptr && strcmp(control, "1") == 0) startControl();
 }
 
 __attribute__((destructor)) void reportCounts() {
     const char* path = getenv("TAV_IPMI_SIM_COUNTS");
     if (path == nullptr || *path == '\0' || !Sim::Simulator::instance().installed()) return;
-    std::map<std::pair<int, int>, unsigned> counts;
-    for (const auto& r : Sim::Simulator::instance().requests()) ++counts[{r.netfn, r.cmd}];
     FILE* out = fopen(path, "w");
     if (out == nullptr) return;
-    for (const auto& c : counts) fprintf(out, "%02x %02x %u\n", c.first.first, c.first.second, c.second);
+    printCounters(out, "%02x %02x %u\n");
     fclose(out);
 }
 

@@ -16,6 +16,9 @@
 // load with "file:line: message", as ipmi_sim stops at the first bad line.
 
 #include <dlfcn.h>
+#include <errno.h>
+#include <string.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -152,8 +155,13 @@ private:
 };
 
 void ProfileReader::readFile(const std::string& path, int depth) {
+    // Refused with the system's reason, once: a directory opens as a stream
+    // but reads as nothing.
+    struct stat st;
+    if (stat(path.c_str(), &st) != 0) throw std::runtime_error(path + ": " + strerror(errno));
+    if (S_ISDIR(st.st_mode)) throw std::runtime_error(path + ": " + strerror(EISDIR));
     std::ifstream in(path);
-    if (!in) throw std::runtime_error(path + ": cannot open profile");
+    if (!in) throw std::runtime_error(path + ": " + strerror(errno));
     std::string physical;
     std::string joined;
     int lineNo = 0;

@@ -146,6 +146,8 @@ public:
     unsigned exchanges(uint8_t netfn, uint8_t cmd) const;
     unsigned totalExchanges() const;
     std::vector<Request> requests() const;
+    // Exchanges per command, keyed by netfn << 8 | cmd.
+    std::map<uint16_t, unsigned> counters() const;
     void resetCounters();
 
     // Real time each answer takes (benchmarks); 0 answers at once.

@@ -102,6 +102,11 @@ std::vector<Request> Simulator::requests() const {
     return log_;
 }
 
+std::map<uint16_t, unsigned> Simulator::counters() const {
+    std::lock_guard<std::mutex> guard(mutex_);
+    return counters_;
+}
+
 void Simulator::resetCounters() {
     std::lock_guard<std::mutex> guard(mutex_);
     counters_.clear();
@@ -156,6 +161,9 @@ const Fault* Simulator::takeFault(uint8_t netfn, uint8_t cmd, Fault* copy) {
 
 Response Simulator::exchange(const Request& req, Fault* applied) {
     counters_[counterKey(req.netfn, req.cmd)]++;
+    // A long-running program keeps only the recent requests.
+    constexpr size_t kLogLimit = 1u << 16;
+    if (log_.size() >= kLogLimit) log_.erase(log_.begin(), log_.begin() + kLogLimit / 2);
     log_.push_back(req);
     Fault fault;
     const Fault* f = takeFault(req.netfn, req.cmd, &fault);

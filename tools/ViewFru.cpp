@@ -1,3 +1,4 @@
+#include <ctype.h>
 #include <stdio.h>
 
 #include <memory>
@@ -14,10 +15,6 @@ namespace {
 
 using Ipmi::FruKey;
 
-void line(const char* label, const std::string& value) {
-    if (!value.empty()) printf("    %-22s %s\n", label, value.c_str());
-}
-
 // The power-supply values a reader of an inventory looks for.
 const std::pair<const char*, FruKey> kPowerSupply[] = {
     {"PSU capacity (W)", FruKey::PsOverallCapacity},   {"PSU peak (W)", FruKey::PsPeakWattage},
@@ -27,47 +24,81 @@ const std::pair<const char*, FruKey> kPowerSupply[] = {
     {"PSU hot swap", FruKey::PsHotSwap},                {"PSU predictive fail", FruKey::PsPredictiveFailMode},
 };
 
-void showDevice(const Ipmi::IpmiFru& fru) {
+// Snake-case member name of a label such as "PSU capacity (W)".
+std::string keyOf(const std::string& label) {
+    std::string key;
+    for (char c : label) {
+        if (isalnum(static_cast<unsigned char>(c))) key += static_cast<char>(tolower(static_cast<unsigned char>(c)));
+        else if (!key.empty() && key.back() != '_') key += '_';
+    }
+    while (!key.empty() && key.back() == '_') key.pop_back();
+    return key;
+}
+
+struct Fields {
+    Tool::Section& section;
+    Tool::Json& record;
+    // Adds the column once; an empty value leaves the field out.
+    void add(const std::string& label, const std::string& value) {
+        const std::string key = keyOf(label);
+        bool known = false;
+        for (const auto& c : section.columns) known = known || c.key == key;
+        if (!known) section.columns.push_back({key, label});
+        if (!value.empty()) record[key] = value;
+    }
+};
+
+Tool::Json device(const Ipmi::IpmiFru& fru, Tool::Section& section) {
     const Ipmi::IpmiEntity& e = fru.getEntity();
-    printf("  FRU %u %s (%s %u.%u)\n", fru.getDeviceId(), fru.getName().c_str(), e.getName().c_str(), e.id,
-           e.instance);
+    Tool::Json r;
+    Fields f{section, r};
+    f.add("Device ID", std::to_string(fru.getDeviceId()));
+    r["device_id"] = fru.getDeviceId();
+    f.add("Name", fru.getName());
+    f.add("Entity", std::to_string(e.id) + "." + std::to_string(e.instance));
+    f.add("Entity name", e.getName());
     if (auto c = fru.getChassis()) {
-        line("Chassis type", c->getType());
-        line("Chassis part number", c->getPartNumber());
-        line("Chassis serial number", c->getSerialNumber());
+        f.add("Chassis type", c->getType());
+        f.add("Chassis part number", c->getPartNumber());
+        f.add("Chassis serial number", c->getSerialNumber());
     }
     if (auto b = fru.getBoard()) {
-        line("Board manufacturer", b->getManufacturer());
-        line("Board name", b->getName());
-        line("Board serial number", b->getSerialNumber());
-        line("Board part number", b->getPartNumber());
-        line("Board mfg date", b->getMfgDateTime8601());
+        f.add("Board manufacturer", b->getManufacturer());
+        f.add("Board name", b->getName());
+        f.add("Board serial number", b->getSerialNumber());
+        f.add("Board part number", b->getPartNumber());
+        f.add("Board mfg date", b->getMfgDateTime8601());
     }
     if (auto p = fru.getProduct()) {
-        line("Product manufacturer", p->getManufacturer());
-        line("Product name", p->getName());
-        line("Product part number", p->getPartNumber());
-        line("Product version", p->getVersion());
-        line("Product serial number", p->getSerialNumber());
-        line("Product asset tag", p->getAssetTag());
+        f.add("Product manufacturer", p->getManufacturer());
+        f.add("Product name", p->getName());
+        f.add("Product part number", p->getPartNumber());
+        f.add("Product version", p->getVersion());
+        f.add("Product serial number", p->getSerialNumber());
+        f.add("Product asset tag", p->getAssetTag());
     }
     auto m = fru.getMulti();
     constexpr uint8_t psu = Ipmi::fru::recordType::powerSupply;
     if (m && m->isMultiRecordTypePresent(psu))
-        for (const auto& v : kPowerSupply) line(v.first, m->getValue(psu, v.second));
+        for (const auto& v : kPowerSupply) f.add(v.first, m->getValue(psu, v.second));
+    return r;
 }
 
-int showFru(const std::vector<std::string>&) {
+int showFru(std::vector<Tool::Section>& out) {
     // Without a polling loop nothing has read the repository or the devices yet.
     if (Ipmi::IpmiIfcSdrGetInfo(0) != 0) fprintf(stderr, "tavipmi: could not read the SDR repository\n");
     Ipmi::IpmiIfcFruInstantiateAll(0);
-    const auto frus = Ipmi::IpmiIfc::getFrus(0);
-    printf("FRU inventory\n");
-    if (frus.empty()) printf("  (none)\n");
-    for (const auto& f : frus) showDevice(*f);
+    Tool::Section s;
+    s.name = "fru";
+    s.title = "FRU inventory";
+    s.layout = Tool::Section::Fields;
+    s.omitMissing = true;
+    for (const auto& f : Ipmi::IpmiIfc::getFrus(0)) s.records.push_back(device(*f, s));
+    out.push_back(std::move(s));
     return 0;
 }
 
-Tool::ViewRegistrar reg("fru", Tool::View{"FRU inventory: board, product, chassis, power supplies", showFru, 50, true});
+Tool::ViewRegistrar reg("fru", Tool::View{"FRU inventory: board, product, chassis, power supplies", nullptr, showFru,
+                                          50, true});
 
 }  // namespace

@@ -1,10 +1,15 @@
 #include <stdio.h>
 
+#include <CLI/CLI.hpp>
+
 #include "IpmiCommands.h"
 #include "IpmiIfc.h"
+#include "Identity.h"
 #include "Views.h"
 
 namespace {
+
+using Tool::Json;
 
 const char* selfTestText(unsigned result) {
     switch (result) {
@@ -16,44 +21,70 @@ const char* selfTestText(unsigned result) {
     }
 }
 
-void showSelfTest() {
+void addSelfTest(Json& r) {
     uint8_t answer[3] = {0, 0, 0};
     uint16_t length = sizeof answer;
     uint8_t rc = Ipmi::IpmiIfc::sendCmd(Ipmi::cmd::getSelfTestResults, Ipmi::netfn::app, 0, nullptr, &length, answer);
-    if (rc != 0 || length < 3) {
-        printf("  Self test          : unavailable (0x%02x)\n", rc);
-        return;
-    }
-    printf("  Self test          : %s (0x%02x 0x%02x)\n", selfTestText(answer[1]), answer[1], answer[2]);
+    if (rc != 0 || length < 3) return;
+    char code[16];
+    snprintf(code, sizeof code, "0x%02x 0x%02x", answer[1], answer[2]);
+    r["self_test"] = selfTestText(answer[1]);
+    r["self_test_code"] = code;
 }
 
-int showIdentity(const std::vector<std::string>&) {
-    // The networking query opens and closes the device itself, and reads the
-    // device id, OS name and OS version on the way.
-    Ipmi::IpmiIfcOpenIpmiClose(0);
-    Ipmi::IpmiIfc::GetBMCNetworking();
-    if (Ipmi::IpmiIfcOpenIpmiOpen(0) < 0) return 1;
+// The controller keeps the fill bytes of its blocks; they read as spaces.
+std::string trimmed(std::string s) {
+    s.erase(s.find_last_not_of(' ') + 1);
+    return s;
+}
+
+int identity(std::vector<Tool::Section>& out) {
+    if (!Tool::readIdentity()) return 1;
     Ipmi::ipmiifc_device_id id;
     if (Ipmi::IpmiIfc::getManagementControllerInfo(0, id) != 0) {
         fprintf(stderr, "tavipmi: no device id from the controller\n");
         return 1;
     }
-    unsigned manufacturer = id.manufacturer_id[0] | (id.manufacturer_id[1] << 8) | (id.manufacturer_id[2] << 16);
-    printf("Controller\n");
-    printf("  Manufacturer       : %s (%u)\n", Ipmi::IpmiIfc::GetBmcManufacturer().c_str(), manufacturer);
-    printf("  Device ID          : %u\n", id.device_id);
-    printf("  Device revision    : %u\n", id.device_revision & 0x0F);
-    printf("  Firmware version   : %s\n", Ipmi::IpmiIfc::GetBmcFWVersion().c_str());
-    printf("  IPMI version       : %s\n", Ipmi::IpmiIfc::GetBmcIpmiVersion().c_str());
-    printf("  Product ID         : %u\n", id.product_id[0] | (id.product_id[1] << 8));
-    printf("  Aux firmware rev   : %02x %02x %02x %02x\n", id.aux_fw_rev[0], id.aux_fw_rev[1], id.aux_fw_rev[2],
-           id.aux_fw_rev[3]);
-    showSelfTest();
-    printf("  Host OS name       : %s\n", Ipmi::IpmiIfc::GetBmcReportedOSName().c_str());
-    printf("  Host OS version    : %s\n", Ipmi::IpmiIfc::GetBmcReportedOSVersion().c_str());
+    Json r;
+    r["manufacturer"] = Ipmi::IpmiIfc::GetBmcManufacturer();
+    r["manufacturer_id"] = Tool::manufacturerId(id);
+    r["device_id"] = id.device_id;
+    r["device_revision"] = id.device_revision & 0x0F;
+    r["firmware_revision"] = Tool::firmwareRevision(id);
+    r["ipmi_version"] = Ipmi::IpmiIfc::GetBmcIpmiVersion();
+    r["product_id"] = id.product_id[0] | (id.product_id[1] << 8);
+    char aux[24];
+    snprintf(aux, sizeof aux, "%02x %02x %02x %02x", id.aux_fw_rev[0], id.aux_fw_rev[1], id.aux_fw_rev[2],
+             id.aux_fw_rev[3]);
+    r["aux_firmware_revision"] = aux;
+    addSelfTest(r);
+    const std::string osName = trimmed(Ipmi::IpmiIfc::GetBmcReportedOSName());
+    const std::string osVersion = trimmed(Ipmi::IpmiIfc::GetBmcReportedOSVersion());
+    if (!osName.empty()) r["os_name"] = osName;
+    if (!osVersion.empty()) r["os_version"] = osVersion;
+
+    Tool::Section s;
+    s.name = "identity";
+    s.title = "Controller";
+    s.layout = Tool::Section::Fields;
+    s.single = true;
+    s.columns = {{"manufacturer", "Manufacturer"},
+                 {"manufacturer_id", "Manufacturer ID"},
+                 {"device_id", "Device ID"},
+                 {"device_revision", "Device revision"},
+                 {"firmware_revision", "Firmware revision"},
+                 {"ipmi_version", "IPMI version"},
+                 {"product_id", "Product ID"},
+                 {"aux_firmware_revision", "Aux firmware revision"},
+                 {"self_test", "Self test"},
+                 {"self_test_code", "Self test code"},
+                 {"os_name", "Host OS name"},
+                 {"os_version", "Host OS version"}};
+    s.records.push_back(std::move(r));
+    out.push_back(std::move(s));
     return 0;
 }
 
-Tool::ViewRegistrar reg("identity", Tool::View{"controller identity and host OS", showIdentity, 10, true});
+Tool::ViewRegistrar reg("identity", Tool::View{"controller identity and host OS", nullptr, identity, 10, true});
 
 }  // namespace

@@ -6,6 +6,8 @@
 
 namespace {
 
+using Tool::Json;
+
 const char* originText(int origin) {
     switch (origin) {
     case 0: return "unspecified";
@@ -17,19 +19,32 @@ const char* originText(int origin) {
     }
 }
 
-int showLan(const std::vector<std::string>&) {
+int lan(std::vector<Tool::Section>& out) {
     Ipmi::IpmiLan& lan = *Ipmi::IpmiIfc::getLan(0);
     int rc = lan.IpmiIfcLanInstantiate(0);
-    printf("LAN\n");
-    printf("  Channel            : %d\n", lan.getChannel());
-    printf("  IP address         : %s%s\n", lan.getIPv4Address().c_str(), lan.isEnabled() ? "" : " (not read)");
-    printf("  Address origin     : %s (%d)\n", originText(lan.getAddressOrigin()), lan.getAddressOrigin());
-    printf("  Netmask            : %s\n", lan.getIPv4Netmask().c_str());
-    printf("  Default gateway    : %s\n", lan.getIPv4DefaultGateway().c_str());
-    printf("  MAC address        : %s\n", lan.getMACAddress().c_str());
-    auto v6 = lan.getIPv6Addresses();
-    if (v6.empty()) printf("  IPv6 addresses     : none\n");
-    for (const auto& a : v6) printf("  IPv6 address       : %s\n", a.c_str());
+    Json r;
+    r["channel"] = lan.getChannel();
+    if (lan.isEnabled()) r["ip_address"] = lan.getIPv4Address();
+    r["address_origin"] = originText(lan.getAddressOrigin());
+    r["netmask"] = lan.getIPv4Netmask();
+    r["default_gateway"] = lan.getIPv4DefaultGateway();
+    r["mac_address"] = lan.getMACAddress();
+    r["ipv6_addresses"] = lan.getIPv6Addresses();
+
+    Tool::Section s;
+    s.name = "lan";
+    s.title = "LAN";
+    s.layout = Tool::Section::Fields;
+    s.single = true;
+    s.columns = {{"channel", "Channel"},
+                 {"ip_address", "IP address"},
+                 {"address_origin", "Address origin"},
+                 {"netmask", "Netmask"},
+                 {"default_gateway", "Default gateway"},
+                 {"mac_address", "MAC address"},
+                 {"ipv6_addresses", "IPv6 addresses"}};
+    s.records.push_back(std::move(r));
+    out.push_back(std::move(s));
     if (rc != 0) {
         fprintf(stderr, "tavipmi: netmask or gateway could not be read\n");
         return 1;
@@ -37,6 +52,6 @@ int showLan(const std::vector<std::string>&) {
     return 0;
 }
 
-Tool::ViewRegistrar reg("lan", Tool::View{"the controller's LAN settings", showLan, 20, true});
+Tool::ViewRegistrar reg("lan", Tool::View{"the controller's LAN settings", nullptr, lan, 20, true});
 
 }  // namespace

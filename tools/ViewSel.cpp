@@ -2,116 +2,94 @@
 #include <pthread.h>
 #include <signal.h>
 #include <stdio.h>
-#include <stdlib.h>
-#include <string.h>
 #include <time.h>
 
+#include <algorithm>
 #include <atomic>
 #include <memory>
 #include <string>
 #include <thread>
 #include <vector>
 
+#include <CLI/CLI.hpp>
+
 #include "IpmiIfc.h"
 #include "IpmiSel.h"
 #include "IpmiSelData.h"
 #include "IpmiSensor.h"
+#include "SelFacts.h"
 #include "Views.h"
 
 namespace {
 
-// Record types up to here carry a time stamp.
-constexpr uint8_t kLastTimestampedType = 0xDF;
-constexpr uint8_t kFirstGenericType = 0x01;
-constexpr uint8_t kLastGenericType = 0x0C;
-constexpr uint8_t kOffsetMask = 0x0F;
-
-std::string timeText(const Ipmi::IpmiSelData& r) {
-    const uint32_t stamp = r.messageTimeStamp();
-    if (r.recordType() > kLastTimestampedType) return "-";
-    const time_t t = static_cast<time_t>(stamp);
-    struct tm tm;
-    char text[32];
-    if (gmtime_r(&t, &tm) == nullptr || strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S", &tm) == 0) return "?";
-    return text;
-}
-
-std::string severityText(int severity) {
-    switch (severity) {
-    case 5: return "major";
-    case 6: return "critical";
-    case 7: return "fatal";
-    default: return "-";
-    }
-}
-
-// The sensor's name when the SDRs know its number, and its number.
-std::string sensorText(const Ipmi::IpmiSelData& r, const std::vector<std::shared_ptr<Ipmi::IpmiSensor>>& sensors) {
-    if (!r.isSelEventRecord()) return "-";
-    const uint8_t number = r.record().sensor_number;
-    std::string name;
-    for (const auto& s : sensors)
-        if (s && s->getSensorNumber() == number) name = s->getSensorIdString();
-    char text[64];
-    snprintf(text, sizeof text, "%s #0x%02x", name.empty() ? "sensor" : name.c_str(), number);
-    return text;
-}
-
-std::string descriptionText(const Ipmi::IpmiSelData& r) {
-    if (!r.isSelEventRecord()) {
-        char text[32];
-        snprintf(text, sizeof text, "OEM record type 0x%02x", r.recordType());
-        return text;
-    }
-    // Event data 1 of a generic event may carry flags above the offset,
-    // which the exact text lookup does not expect: look up the offset alone.
-    Ipmi::Event_log record = r.record();
-    const uint8_t type = record.event_dir_type & Ipmi::SEL_EVENT_TYPE_MASK;
-    if (type >= kFirstGenericType && type <= kLastGenericType) record.event_data[0] &= kOffsetMask;
-    return Ipmi::GetMessage(record);
-}
-
-void printHeader() {
-    printf("  %-4s | %-19s | %-20s | %-48s | %-8s | %s\n", "ID", "Time (UTC)", "Sensor", "Caption", "Severity",
-           "Description");
-}
-
-void printRecord(const Ipmi::IpmiSelData& r, const std::vector<std::shared_ptr<Ipmi::IpmiSensor>>& sensors) {
-    printf("  %-4s | %-19s | %-20s | %-48s | %-8s | %s\n", r.recordId(r.recordId()).c_str(), timeText(r).c_str(),
-           sensorText(r, sensors).c_str(), r.caption().c_str(), severityText(r.severity()).c_str(),
-           descriptionText(r).c_str());
-}
-
 // The controller's event log, oldest record first.
-int showSel(const std::vector<std::string>&) {
+int showSel(std::vector<Tool::Section>& out) {
     Ipmi::IpmiIfcSdrGetInfo(0);  // sensor names
-    printf("System event log\n");
-    if (Ipmi::IpmiIfcSelGetInfo(0, nullptr) != 0) {
-        printf("  (unavailable)\n");
+    Tool::Section s;
+    s.name = "sel";
+    s.title = "System event log";
+    s.columns = Tool::selColumns();
+    const bool read = Ipmi::IpmiIfcSelGetInfo(0, nullptr) == 0;
+    if (read) {
+        const auto sensors = Ipmi::IpmiIfc::getSensors(0);
+        for (const auto& r : Ipmi::IpmiIfc::getSelData(0)) s.records.push_back(Tool::selRecord(*r, sensors));
+    }
+    out.push_back(std::move(s));
+    if (!read) {
+        fprintf(stderr, "tavipmi: the system event log could not be read\n");
         return 1;
     }
-    const auto records = Ipmi::IpmiIfc::getSelData(0);
-    if (records.empty()) {
-        printf("  (empty)\n");
-        return 0;
-    }
-    const auto sensors = Ipmi::IpmiIfc::getSensors(0);
-    printHeader();
-    for (const auto& r : records) printRecord(*r, sensors);
     return 0;
 }
 
 // ---- watch -------------------------------------------------------------------
 
+// A stream cannot size its columns from content: the table keeps fixed
+// widths, JSON gives one object per line, CSV one row per record.
+const int kWidths[] = {4, 19, 20, 48, 8};
+
+void printHeader() {
+    if (Tool::outputFormat() == Tool::Format::Csv) printf("%s\n", Tool::csvHeader(Tool::selColumns()).c_str());
+    if (Tool::outputFormat() != Tool::Format::Table) return;
+    printf("  %-4s | %-19s | %-20s | %-48s | %-8s | %s\n", "ID", "Time (UTC)", "Sensor", "Caption", "Severity",
+           "Description");
+}
+
+void printRecord(const Tool::Json& r) {
+    const auto cols = Tool::selColumns();
+    if (Tool::outputFormat() != Tool::Format::Table) {
+        const std::string line = Tool::outputFormat() == Tool::Format::Json ? r.dump() : Tool::csvRow(cols, r);
+        printf("%s\n", line.c_str());
+        return;
+    }
+    std::string line = " ";
+    size_t w = 0;
+    for (const auto& c : cols) {
+        if (c.use == Tool::Column::DataOnly) continue;
+        std::string text = Tool::cellText(r.contains(c.key) ? r[c.key] : Tool::Json());
+        if (w < sizeof kWidths / sizeof kWidths[0]) text.resize(std::max(text.size(), size_t(kWidths[w])), ' ');
+        line += (w ? " | " : " ") + text;
+        ++w;
+    }
+    printf("%s\n", line.c_str());
+}
+
 struct Watch {
     std::atomic<int> printed{0};
     int limit = 0;  // 0: until interrupted
+    bool demo = false;
 };
+Watch watch;
+
+void watchOptions(CLI::App& sub) {
+    sub.add_flag("--demo", watch.demo, "on the simulated BMC, log an event a second");
+    sub.add_option("--count", watch.limit, "end after N records")->check(CLI::NonNegativeNumber);
+}
 
 void printNewRecord(void* context, Ipmi::IpmiSelData* record) {
     if (record == nullptr) return;  // the loop's periodic call
     auto* w = static_cast<Watch*>(context);
-    printRecord(*record, Ipmi::IpmiIfc::getSensors(0));
+    printRecord(Tool::selRecord(*record, Ipmi::IpmiIfc::getSensors(0)));
     fflush(stdout);
     ++w->printed;
 }
@@ -132,21 +110,10 @@ void injectDemoEvent(AddSelEvent add, unsigned n) {
 // Prints each new SEL record as the polling loop finds it, until SIGINT or
 // SIGTERM (or `--count N` records). `--demo` logs an event a second on a
 // simulated controller.
-int watchSel(const std::vector<std::string>& args) {
-    Watch w;
-    bool demo = false;
-    for (size_t i = 0; i < args.size(); ++i) {
-        if (args[i] == "--demo") {
-            demo = true;
-        } else if (args[i] == "--count" && i + 1 < args.size()) {
-            w.limit = atoi(args[++i].c_str());
-        } else {
-            fprintf(stderr, "usage: tavipmi watch [--demo] [--count N]\n");
-            return 2;
-        }
-    }
-    AddSelEvent add = demo ? simulatorEventSource() : nullptr;
-    if (demo && add == nullptr) {
+int watchSel(std::vector<Tool::Section>&) {
+    Watch& w = watch;
+    AddSelEvent add = w.demo ? simulatorEventSource() : nullptr;
+    if (w.demo && add == nullptr) {
         fprintf(stderr, "tavipmi: --demo needs the simulated BMC (--simulate)\n");
         return 2;
     }
@@ -160,7 +127,7 @@ int watchSel(const std::vector<std::string>& args) {
     sigaddset(&stopSignals, SIGTERM);
     pthread_sigmask(SIG_BLOCK, &stopSignals, nullptr);  // only the waiter below takes them
 
-    printf("Watching the system event log (Ctrl-C ends)\n");
+    if (Tool::outputFormat() == Tool::Format::Table) printf("Watching the system event log (Ctrl-C ends)\n");
     printHeader();
     fflush(stdout);
     // A pass a second: the loop's own period is counted in 16-second units.
@@ -193,7 +160,8 @@ int watchSel(const std::vector<std::string>& args) {
     return rc;
 }
 
-Tool::ViewRegistrar reg("sel", Tool::View{"system event log records, oldest first", showSel, 50, true});
-Tool::ViewRegistrar regWatch("watch", Tool::View{"print new SEL records as they are logged, until Ctrl-C", watchSel, 100, false});
+Tool::ViewRegistrar reg("sel", Tool::View{"system event log records, oldest first", nullptr, showSel, 50, true});
+Tool::ViewRegistrar regWatch("watch", Tool::View{"print new SEL records as they are logged, until Ctrl-C",
+                                                 watchOptions, watchSel, 100, false});
 
 }  // namespace

@@ -1,4 +1,4 @@
-// tavipmi: one-shot views of the host's BMC through tav-ipmi.
+// tavipmi: views of the host's BMC through tav-ipmi, and a metrics endpoint.
 
 #include <errno.h>
 #include <limits.h>
@@ -13,11 +13,16 @@
 #include <string>
 #include <vector>
 
+#include <CLI/CLI.hpp>
+
 #include "IpmiIfc.h"
 #include "IpmiMapper.h"
 #include "Views.h"
 
 namespace Tool {
+Format chosenFormat = Format::Table;
+Format outputFormat() { return chosenFormat; }
+
 std::map<std::string, View>& views() {
     static std::map<std::string, View> all;
     return all;
@@ -25,16 +30,6 @@ std::map<std::string, View>& views() {
 }  // namespace Tool
 
 namespace {
-
-void usage(FILE* out) {
-    fprintf(out,
-            "usage: tavipmi [--simulate[=PROFILE]] [VIEW [ARGS...]]\n"
-            "       tavipmi --help | --version\n"
-            "  --simulate[=PROFILE]  talk to the simulated BMC (default profile, or an ipmi_sim .emu file)\n"
-            "  --simulate=IMAGE.bin  the default simulated BMC serving a raw FRU image as FRU device 0\n"
-            "views:\n");
-    for (const auto& v : Tool::views()) fprintf(out, "  %-10s %s\n", v.first.c_str(), v.second.help.c_str());
-}
 
 // The running tool's own file, or "" when the system does not say.
 std::string ownPath() {
@@ -88,6 +83,44 @@ int reexecSimulated(char** argv, const std::string& profile) {
 #endif
 }
 
+// Views in the order of the default output.
+std::vector<std::string> defaultViews() {
+    std::vector<std::pair<int, std::string>> order;
+    for (const auto& v : Tool::views())
+        if (v.second.inDefault) order.emplace_back(v.second.order, v.first);
+    std::sort(order.begin(), order.end());
+    std::vector<std::string> out;
+    for (const auto& o : order) out.push_back(o.second);
+    return out;
+}
+
+int runInCommandLineMode(const std::vector<std::string>& selected, Tool::Format format) {
+    if (Ipmi::IpmiIfcOpenIpmiOpen(0) < 0) {
+        fprintf(stderr, "tavipmi: cannot open /dev/ipmi0: %s\n", strerror(errno));
+        return 1;
+    }
+    Tool::loadHealthRules();
+    if (Ipmi::IpmiIfcInitForCLI(0) < 0) {
+        fprintf(stderr, "tavipmi: cannot prepare the IPMI interface\n");
+        Ipmi::IpmiIfcOpenIpmiClose(0);
+        return 1;
+    }
+    int rc = 0;
+    std::vector<Tool::Section> sections;
+    for (const auto& name : selected) {
+        int r = Tool::views()[name].run(sections);
+        if (r != 0) rc = r;
+    }
+    if (!sections.empty()) Tool::render(sections, format, stdout);
+    Ipmi::IpmiIfcCloseForCLI(0);
+    Ipmi::IpmiIfcOpenIpmiClose(0);
+    return rc;
+}
+
+}  // namespace
+
+namespace Tool {
+
 // The rules normally live in /etc. A tool installed under another prefix, or
 // run from its build tree, uses the copy that came with it.
 void loadHealthRules() {
@@ -96,66 +129,55 @@ void loadHealthRules() {
     if (!rules.empty()) Ipmi::LoadSensorHealthDataFile(rules.c_str());
 }
 
-}  // namespace
+}  // namespace Tool
 
 int main(int argc, char** argv) {
-    std::vector<std::string> args;
+    CLI::App app{"tavipmi: views of the host's baseboard management controller through tav-ipmi.\n"
+                 "Without a view, every default view is shown.",
+                 "tavipmi"};
+    app.set_version_flag("--version", std::string("tavipmi (tav-ipmi) ") + TAV_IPMI_VERSION);
     std::string profile;
-    bool simulate = false;
-    for (int i = 1; i < argc; ++i) {
-        std::string a = argv[i];
-        if (a == "--simulate") {
-            simulate = true;
-            profile = "default";
-        } else if (a.rfind("--simulate=", 0) == 0) {
-            simulate = true;
-            profile = a.substr(strlen("--simulate="));
-        } else if (a == "--version") {
-            printf("tavipmi (tav-ipmi) %s\n", TAV_IPMI_VERSION);
-            return 0;
-        } else if (a == "-h" || a == "--help") {
-            usage(stdout);
-            return 0;
-        } else {
-            args.push_back(a);
-        }
+    app.add_option("--simulate", profile,
+                   "talk to the simulated BMC: its default server, an ipmi_sim .emu, raw .sdr or SEL file, "
+                   "or the default server with a raw FRU image (.bin) as FRU device 0")
+        ->expected(0, 1)
+        ->default_str("default");
+    Tool::Format format = Tool::Format::Table;
+    const std::map<std::string, Tool::Format> formats{
+        {"table", Tool::Format::Table}, {"json", Tool::Format::Json}, {"csv", Tool::Format::Csv}};
+    app.add_option("--format", format, "output format: table, json or csv (default table)")
+        ->transform(CLI::CheckedTransformer(formats))
+        ->option_text("table|json|csv");
+    app.require_subcommand(0, 1);
+    app.fallthrough();  // the global options may follow the view
+    std::map<CLI::App*, std::string> byCommand;
+    for (auto& v : Tool::views()) {
+        CLI::App* sub = app.add_subcommand(v.first, v.second.help);
+        if (v.second.options) v.second.options(*sub);
+        byCommand[sub] = v.first;
     }
-    if (simulate && getenv("TAVIPMI_SIMULATED") == nullptr) return reexecSimulated(argv, profile);
-
-    std::vector<std::string> selected;
-    std::vector<std::string> viewArgs;
-    if (!args.empty()) {
-        if (Tool::views().count(args[0]) == 0) {
-            fprintf(stderr, "tavipmi: unknown view '%s'\n", args[0].c_str());
-            usage(stderr);
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::ParseError& e) {
+        // Every refusal shows the usage, on stderr, with exit status 2.
+        if (e.get_exit_code() != 0) {
+            fprintf(stderr, "tavipmi: %s\n", e.what());
+            fprintf(stderr, "%s", app.help().c_str());
             return 2;
         }
-        selected.push_back(args[0]);
-        viewArgs.assign(args.begin() + 1, args.end());
-    } else {
-        std::vector<std::pair<int, std::string>> order;
-        for (const auto& v : Tool::views())
-            if (v.second.inDefault) order.emplace_back(v.second.order, v.first);
-        std::sort(order.begin(), order.end());
-        for (const auto& o : order) selected.push_back(o.second);
+        return app.exit(e);
     }
+    if (app.count("--simulate") && getenv("TAVIPMI_SIMULATED") == nullptr)
+        return reexecSimulated(argv, profile.empty() ? "default" : profile);
 
-    if (Ipmi::IpmiIfcOpenIpmiOpen(0) < 0) {
-        fprintf(stderr, "tavipmi: cannot open /dev/ipmi0: %s\n", strerror(errno));
-        return 1;
+    Tool::chosenFormat = format;
+    std::vector<std::string> selected;
+    for (CLI::App* sub : app.get_subcommands()) selected.push_back(byCommand[sub]);
+    if (selected.empty()) selected = defaultViews();
+    const Tool::View& first = Tool::views()[selected[0]];
+    if (first.ownsDevice) {
+        std::vector<Tool::Section> none;
+        return first.run(none);
     }
-    loadHealthRules();
-    if (Ipmi::IpmiIfcInitForCLI(0) < 0) {
-        fprintf(stderr, "tavipmi: cannot prepare the IPMI interface\n");
-        Ipmi::IpmiIfcOpenIpmiClose(0);
-        return 1;
-    }
-    int rc = 0;
-    for (const auto& name : selected) {
-        int r = Tool::views()[name].run(viewArgs);
-        if (r != 0) rc = r;
-    }
-    Ipmi::IpmiIfcCloseForCLI(0);
-    Ipmi::IpmiIfcOpenIpmiClose(0);
-    return rc;
+    return runInCommandLineMode(selected, format);
 }

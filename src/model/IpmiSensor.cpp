@@ -392,6 +392,18 @@ void IpmiSensor::setThresholdReading(unsigned char* eight_bytes) {
 
 bool IpmiSensor::hasReadingTime() const { return currentReading().time != 0; }
 
+IpmiSensor::CachedState IpmiSensor::getCachedState() const {
+    CachedState out;
+    TAV::MutexLock guard(state_mutex);
+    memcpy(out.reading, reading, sizeof out.reading);
+    out.readingLength = reading_length;
+    out.readingValid = reading_valid;
+    out.lastPollResult = last_poll_result;
+    out.readingTime = reading_time;
+    memcpy(out.thresholds, threshold_reading, sizeof out.thresholds);
+    return out;
+}
+
 void IpmiSensor::getReadingTime(std::string& out) const {
     const time_t seconds = static_cast<time_t>(currentReading().time / 1000000u);
     struct tm utc;

@@ -1,0 +1,40 @@
+// The metrics text that `tavipmi serve` answers scrapes with, built on other
+// threads while the polling loop refreshes the sensors it reads.
+
+#ifdef TAV_IPMI_TOOL_CORE
+
+#include <atomic>
+#include <thread>
+
+#include "IpmiIfc.h"
+#include "Metrics.h"
+#include "TestSupport.h"
+
+namespace {
+
+using namespace Ipmi;
+
+class Metrics : public TestSupport::SimTest {
+protected:
+    Metrics() { openDevice = false; }
+};
+
+TEST_F(Metrics, ScrapesWhileTheLoopRefreshesReadTheCaches) {
+    useBmc(Sim::loadProfile(Sim::defaultProfilePath()));
+    TestSupport::LoopThread loop(1);
+    ASSERT_EQ(IpmiIfc::waitState(12), IpmiIfc::IPMI_STATE_RUNNING);
+    std::atomic<bool> done{false};
+    std::thread refresher([&] {
+        bool shutdown = false;
+        while (!done) IpmiIfc::pollAll(1, true, IPMI_POLL_SENSORS, &shutdown);
+    });
+    const std::string reading = "tavipmi_sensor_watts{name=\"PS1 Input Power\",number=\"64\",entity=\"10.1\",type=\"Other\"} 232\n";
+    for (int i = 0; i < 20; ++i) EXPECT_NE(Tool::metricsText().find(reading), std::string::npos);
+    done = true;
+    refresher.join();
+    EXPECT_GT(sim().exchanges(netfn::sensorEvent, cmd::getSensorReading), 0u);
+}
+
+}  // namespace
+
+#endif
