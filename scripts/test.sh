@@ -59,10 +59,10 @@ TSAN_OPTIONS="halt_on_error=1 symbolize=0" ctest --test-dir build-tsan --output-
   -E 'PeerTools|Peer' | symbolize_frames
 
 echo "== fuzz targets (bounded run, ASan + UBSan)"
-# Half a minute per target; skipped where clang and its fuzzer runtime are missing.
+# Twenty seconds per target; skipped where clang and its fuzzer runtime are missing.
 if command -v clang++ >/dev/null &&
   compgen -G "/usr/lib/llvm-*/lib/clang/*/lib/linux/libclang_rt.fuzzer-x86_64.a" >/dev/null; then
-  scripts/fuzz.sh "${TAV_IPMI_FUZZ_SECONDS:-30}"
+  scripts/fuzz.sh "${TAV_IPMI_FUZZ_SECONDS:-20}"
 else
   echo "clang or libFuzzer not installable here: fuzz targets skipped"
 fi
