@@ -140,13 +140,14 @@ void checkViews(Checks& checks) {
     bool inViews = false;
     int seen = 0;
     for (const std::string& line : lines(help.out)) {
-        if (line == "views:") {
+        if (line == "Subcommands:") {
             inViews = true;
             continue;
         }
         std::string entry = trim(line);
         if (!inViews || entry.empty()) continue;
         const std::string name = entry.substr(0, entry.find(' '));
+        if (name == "serve") continue;  // a server: the Prometheus test runs it
         const std::string about = trim(entry.substr(name.size()));
         std::string args;
         size_t colon = about.find(':');
