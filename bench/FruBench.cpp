@@ -1,21 +1,16 @@
 // FRU discovery of every device of the real server profile with the most FRU
-// data: exchanges per pass (checked against the algorithm's own count), CPU
-// per exchange in virtual time, wall time against exchanges x latency with a
-// controller that answers at a fixed latency, and ipmitool's `fru print` on
-// the same simulated controller for comparison.
+// data, against the bare client's replay of its requests (BenchSupport.h):
+// exchanges per pass (checked against the algorithm's own count), wall time
+// at the latency and CPU beyond the bare client's.
 
 #include <benchmark/benchmark.h>
 #include <dirent.h>
-#include <stdio.h>
-#include <stdlib.h>
-#include <string.h>
-#include <unistd.h>
 
-#include <fstream>
 #include <memory>
 #include <set>
 #include <string>
 
+#include "BenchSupport.h"
 #include "Bmc.h"
 #include "FruLayout.h"
 #include "IpmiIfcInternal.h"
@@ -26,7 +21,7 @@ namespace {
 
 using namespace Ipmi;
 
-Sim::Simulator& sim() { return Sim::Simulator::instance(); }
+using Bench::sim;
 
 size_t fruBytes(const Sim::Bmc& bmc) {
     size_t n = 0;
@@ -103,14 +98,14 @@ size_t algorithmExchanges(const Sim::Bmc& bmc) {
     return n;
 }
 
-bool prepare(benchmark::State& state, std::shared_ptr<Sim::Bmc>& bmc, bool virtualTime) {
+bool prepare(benchmark::State& state, std::shared_ptr<Sim::Bmc>& bmc) {
     const std::string profile = largestProfile();
     if (profile.empty()) {
         state.SkipWithError("real server profiles not present");
         return false;
     }
     bmc = Sim::loadProfile(profile);
-    sim().install(bmc, virtualTime);
+    sim().install(bmc, true);
     sim().clearFaults();
     InitIpmiNode(0);
     g_IpmiNode[0].myAddress = 0x20;
@@ -133,74 +128,23 @@ void finish() {
     sim().uninstall();
 }
 
-// One pass per iteration; `latencyUs` 0 runs in virtual time.
-void discovery(benchmark::State& state, int64_t latencyUs) {
+void BM_FruDiscovery(benchmark::State& state) {
     std::shared_ptr<Sim::Bmc> bmc;
-    if (!prepare(state, bmc, latencyUs == 0)) return;
-    sim().setLatencyUs(latencyUs);
+    if (!prepare(state, bmc)) return;
     const size_t expected = algorithmExchanges(*bmc);
-    size_t exchanges = 0, devices = 0, reads = 0;
+    Bench::Versus v(20);
     for (auto _ : state) {
-        state.PauseTiming();
-        sim().resetCounters();
-        state.ResumeTiming();
-        IpmiIfcFruInstantiateAll(0);
-        state.PauseTiming();
-        exchanges = sim().totalExchanges();
-        reads = sim().exchanges(netfn::storage, cmd::readFruData);
-        devices = IpmiIfc::getFrus(0).size();
-        state.ResumeTiming();
+        if (!v.add(state, [] {}, [] { IpmiIfcFruInstantiateAll(0); })) break;
+        if (v.lastExchanges() != expected) {
+            state.SkipWithError(("exchanges " + std::to_string(v.lastExchanges()) + ", the algorithm needs " +
+                                 std::to_string(expected)).c_str());
+            break;
+        }
     }
-    if (exchanges != expected)
-        state.SkipWithError(("exchanges " + std::to_string(exchanges) + ", the algorithm needs " +
-                             std::to_string(expected)).c_str());
-    state.counters["devices"] = static_cast<double>(devices);
-    state.counters["exchanges"] = static_cast<double>(exchanges);
-    state.counters["read_fru_data"] = static_cast<double>(reads);
-    if (latencyUs == 0) {
-        state.counters["per_exchange"] = benchmark::Counter(
-            static_cast<double>(exchanges), benchmark::Counter::kIsIterationInvariantRate | benchmark::Counter::kInvert);
-    } else {
-        // Wall time of a pass over what the exchanges alone must take.
-        state.counters["floor_ms"] = static_cast<double>(exchanges) * static_cast<double>(latencyUs) / 1000.0;
-    }
+    v.report(state);
+    state.counters["devices"] = static_cast<double>(IpmiIfc::getFrus(0).size());
     finish();
 }
-
-void BM_FruDiscoveryCpu(benchmark::State& state) { discovery(state, 0); }
-BENCHMARK(BM_FruDiscoveryCpu)->Unit(benchmark::kMillisecond);
-
-void BM_FruDiscoveryAtLatency(benchmark::State& state) { discovery(state, state.range(0)); }
-BENCHMARK(BM_FruDiscoveryAtLatency)->Arg(200)->Arg(1000)->Iterations(3)->UseRealTime()->Unit(benchmark::kMillisecond);
-
-// ipmitool `fru print` on the same controller: what it asks, counted by the
-// simulator inside its process.
-void BM_IpmitoolFruPrint(benchmark::State& state) {
-    const std::string profile = largestProfile();
-    if (profile.empty() || system("command -v ipmitool >/dev/null 2>&1") != 0) {
-        state.SkipWithError("ipmitool or the real server profiles not present");
-        return;
-    }
-    const std::string counts = "/tmp/tav-fru-bench-counts-" + std::to_string(getpid());
-    const std::string command = "TAV_IPMI_SIM_PROFILE='" + profile + "' TAV_IPMI_SIM_VIRTUAL_TIME=1 TAV_IPMI_SIM_COUNTS='" +
-                                counts + "' LD_PRELOAD='" TAV_IPMI_PRELOAD_LIB "' ipmitool -I open fru print >/dev/null 2>&1";
-    for (auto _ : state) {
-        if (system(command.c_str()) == -1) state.SkipWithError("cannot run ipmitool");
-    }
-    unsigned total = 0, reads = 0, info = 0;
-    std::ifstream in(counts);
-    unsigned netfn = 0, cmd = 0, n = 0;
-    while (in >> std::hex >> netfn >> cmd >> std::dec >> n) {
-        total += n;
-        if (netfn == netfn::storage && cmd == cmd::readFruData) reads = n;
-        if (netfn == netfn::storage && cmd == cmd::getFruInventoryAreaInfo) info = n;
-    }
-    unlink(counts.c_str());
-    state.SetLabel(profile.substr(profile.rfind('/') + 1));
-    state.counters["exchanges"] = total;
-    state.counters["read_fru_data"] = reads;
-    state.counters["area_info"] = info;
-}
-BENCHMARK(BM_IpmitoolFruPrint)->Iterations(1)->UseRealTime()->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_FruDiscovery)->Iterations(4)->Unit(benchmark::kMillisecond);
 
 }  // namespace

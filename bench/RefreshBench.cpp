@@ -1,61 +1,32 @@
-// The two refreshes of the polling loop against a simulated controller that
-// answers every request after a fixed real latency (virtual time off):
+// The sensor side of the polling loop against the simulated controller, each
+// operation against the bare client's replay of its requests (BenchSupport.h):
 //
 // - the full chain that an accepted repository info starts: reservation,
 //   repository read, sensor discovery with first readings, thresholds and
-//   hysteresis, entity list and tree;
-// - the per-poll reading refresh of every sensor.
-//
-// Reported per run: exchanges, the floor that the latency sets (exchanges x
-// latency) and wall time over that floor; CPU per exchange of the library,
-// measured as the process CPU time of the run (CLOCK_PROCESS_CPUTIME_ID; the
-// latency is slept, not spun) minus the CPU time of replaying the same
-// requests through the simulator's fault layer and command table, so that
-// the fake driver's ioctl and poll emulation stays in the library's share;
-// and peak memory (ru_maxrss, which includes the simulator's request log).
+//   hysteresis, entity list and tree; and the heap the sensors it leaves cost;
+// - the per-poll reading refresh of every sensor;
+// - one pass of the loop that finds nothing new (seven passes in eight) and
+//   one periodic pass (readings, handlers, LAN);
+// - a caller's `getSensors` with every sensor's cached reading and state;
+// - the chain at 100, 1,000 and 4,000 records, for how its cost grows.
 
 #include <benchmark/benchmark.h>
 #include <string.h>
-#include <sys/resource.h>
-#include <time.h>
 
-#include <chrono>
 #include <memory>
 #include <string>
-#include <vector>
 
+#include "BenchSupport.h"
 #include "Bmc.h"
 #include "GeneratedServer.h"
 #include "IpmiIfcInternal.h"
-#include "SdrLayout.h"
+#include "IpmiSensor.h"
 #include "Sim.h"
 
 namespace {
 
 using namespace Ipmi;
-using Bench::generatedServer;
-
-constexpr int64_t kLatencyUs = 1000;
-
-Sim::Simulator& sim() { return Sim::Simulator::instance(); }
-
-double processCpuSeconds() {
-    timespec ts;
-    clock_gettime(CLOCK_PROCESS_CPUTIME_ID, &ts);
-    return static_cast<double>(ts.tv_sec) + static_cast<double>(ts.tv_nsec) / 1e9;
-}
-
-double wallSeconds() {
-    return std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count();
-}
-
-long peakRssKb() {
-    struct rusage usage;
-    getrusage(RUSAGE_SELF, &usage);
-    return usage.ru_maxrss;
-}
-
-// ---- running the refreshes
+using Bench::sim;
 
 void forgetEverything() {
     IpmiIfcSdrCleanUpAll(0);
@@ -64,17 +35,24 @@ void forgetEverything() {
     memset(&g_IpmiNode[0].work.sdr, 0, sizeof g_IpmiNode[0].work.sdr);
 }
 
+std::shared_ptr<Sim::Bmc> server(benchmark::State& state) {
+    if (state.range(0) == 0) return Sim::loadProfile(Sim::defaultProfilePath());
+    return Bench::generatedServer(static_cast<size_t>(state.range(0)));
+}
+
+// The node open on `bmc` with its repository read, or false with the reason.
 bool prepare(benchmark::State& state, const std::shared_ptr<Sim::Bmc>& bmc) {
-    sim().install(bmc, false);
+    sim().install(bmc, true);
     sim().clearFaults();
     sim().setLatencyUs(0);
     InitIpmiNode(0);
     g_IpmiNode[0].myAddress = 0x20;
     g_IpmiNode[0].stopRequested = false;
-    if (IpmiIfcOpenIpmiOpen(0) < 0) {
-        state.SkipWithError("cannot open the simulated device");
+    if (IpmiIfcOpenIpmiOpen(0) < 0 || IpmiIfcSdrGetInfo(0) != 0 || IpmiIfc::getSensors(0).empty()) {
+        state.SkipWithError("no sensors discovered on the simulated controller");
         return false;
     }
+    state.SetLabel(state.range(0) == 0 ? "default profile" : std::to_string(state.range(0)) + " records");
     return true;
 }
 
@@ -86,89 +64,90 @@ void finishRun() {
     sim().uninstall();
 }
 
-// CPU time the simulator itself needs for these requests, without latency.
-double simulatorCpuSeconds(const std::vector<Sim::Request>& requests) {
-    const double start = processCpuSeconds();
-    for (const Sim::Request& r : requests) benchmark::DoNotOptimize(sim().exchange(r, nullptr));
-    return processCpuSeconds() - start;
+// Heap the sensors, records and entities of one chain hold, per sensor.
+double heapPerSensor() {
+    forgetEverything();
+    IpmiIfcSensorInstantiateAll(0);
+    sim().resetCounters();
+    const long long before = Bench::liveHeapBytes();
+    IpmiIfcSdrGetInfo(0);
+    sim().resetCounters();  // the simulator's request log is not the library's
+    const size_t sensors = IpmiIfc::getSensors(0).size();
+    return sensors ? static_cast<double>(Bench::liveHeapBytes() - before) / static_cast<double>(sensors) : 0;
 }
 
-struct Totals {
-    double exchanges = 0, wall = 0, cpu = 0, simCpu = 0;
-    long runs = 0;
-};
-
-// Runs `refresh` once per iteration with the latency on and keeps the figures.
-template <class Setup, class Refresh>
-void measure(benchmark::State& state, Setup setup, Refresh refresh) {
-    Totals t;
-    for (auto _ : state) {
-        state.PauseTiming();
-        setup();
-        sim().resetCounters();
-        sim().setLatencyUs(kLatencyUs);
-        const double cpu0 = processCpuSeconds();
-        const double wall0 = wallSeconds();
-        state.ResumeTiming();
-
-        refresh();
-
-        state.PauseTiming();
-        const double wall = wallSeconds() - wall0;
-        const double cpu = processCpuSeconds() - cpu0;
-        sim().setLatencyUs(0);
-        const std::vector<Sim::Request> requests = sim().requests();
-        t.exchanges += static_cast<double>(requests.size());
-        t.wall += wall;
-        t.cpu += cpu;
-        t.simCpu += simulatorCpuSeconds(requests);
-        ++t.runs;
-        sim().resetCounters();
-        state.ResumeTiming();
-    }
-    if (t.runs == 0 || t.exchanges == 0) return;
-    const double perRun = t.exchanges / static_cast<double>(t.runs);
-    const double floor = t.exchanges * static_cast<double>(kLatencyUs) / 1e6;
-    state.counters["exchanges"] = perRun;
-    state.counters["floor_ms"] = floor / static_cast<double>(t.runs) * 1e3;
-    state.counters["wall_over_floor"] = t.wall / floor;
-    state.counters["lib_cpu_us_per_exchange"] = (t.cpu - t.simCpu) / t.exchanges * 1e6;
-    state.counters["sim_cpu_us_per_exchange"] = t.simCpu / t.exchanges * 1e6;
+void BM_RefreshChain(benchmark::State& state) {
+    if (!prepare(state, server(state))) return;
+    Bench::Versus v(state.range(0) == 0 ? 25 : 3);
+    for (auto _ : state)
+        if (!v.add(state, forgetEverything, [] { IpmiIfcSdrGetInfo(0); })) break;
+    v.report(state);
     state.counters["sensors"] = static_cast<double>(IpmiIfc::getSensors(0).size());
-    state.counters["peak_rss_kB"] = static_cast<double>(peakRssKb());
-}
-
-void fullChain(benchmark::State& state, const std::shared_ptr<Sim::Bmc>& bmc) {
-    if (!prepare(state, bmc)) return;
-    measure(state, forgetEverything, [&state] {
-        if (IpmiIfcSdrGetInfo(0) != 0) state.SkipWithError("the repository info was refused");
-    });
+    state.counters["heap_bytes_per_sensor"] = heapPerSensor();
     finishRun();
 }
+BENCHMARK(BM_RefreshChain)->Arg(0)->Arg(1000)->Iterations(4)->Unit(benchmark::kMillisecond);
 
-void readingRefresh(benchmark::State& state, const std::shared_ptr<Sim::Bmc>& bmc) {
-    if (!prepare(state, bmc)) return;
-    if (IpmiIfcSdrGetInfo(0) != 0 || IpmiIfc::getSensors(0).empty()) {
-        state.SkipWithError("no sensors discovered");
-        finishRun();
-        return;
+void BM_ReadingRefresh(benchmark::State& state) {
+    if (!prepare(state, server(state))) return;
+    Bench::Versus v(state.range(0) == 0 ? 50 : 5);
+    for (auto _ : state)
+        if (!v.add(state, [] {}, [] { IpmiIfcSensorUpdateReading(0); })) break;
+    v.report(state);
+    finishRun();
+}
+BENCHMARK(BM_ReadingRefresh)->Arg(0)->Arg(1000)->Iterations(4)->Unit(benchmark::kMillisecond);
+
+// range(1): 1 for the pass the loop makes seven times in eight (the SEL count
+// read, nothing new), 8 for the periodic one.
+void BM_PollPass(benchmark::State& state) {
+    if (!prepare(state, server(state))) return;
+    const int every = static_cast<int>(state.range(1));
+    IpmiNode& n = g_IpmiNode[0];
+    IpmiLoopState s;
+    IpmiIfcSelGetInfo(0, &s.entryCount);
+    s.lastEntryCount = s.entryCount;
+    s.sdrCycle = 1;  // neither repository nor FRU due: a steady periodic pass
+    IpmiIfc::getLan(0)->IpmiIfcLanInstantiate(0);
+    TAV::MutexLock passLock(n.pollMutex);
+    Bench::Versus v(every == 8 ? 20 : 10);
+    for (auto _ : state) {
+        auto setup = [&] {
+            n.pollType = IPMI_POLL_NORMAL;
+            n.pollCount = every == 8 ? 8 : 9;
+            s.sdrCycle = 1;
+        };
+        if (!v.add(state, setup, [&] { IpmiIfcPollPass(0, s); })) break;
     }
-    measure(state, [] {}, [] { benchmark::DoNotOptimize(IpmiIfcSensorUpdateReading(0)); });
+    v.report(state);
+    state.SetLabel(std::string(every == 8 ? "periodic pass, " : "steady pass, ") +
+                   (state.range(0) == 0 ? "default profile" : std::to_string(state.range(0)) + " records"));
     finishRun();
 }
+BENCHMARK(BM_PollPass)->Args({0, 1})->Args({1000, 1})->Iterations(200)->Unit(benchmark::kMicrosecond);
+BENCHMARK(BM_PollPass)->Args({0, 8})->Iterations(10)->Unit(benchmark::kMicrosecond);
 
-void BM_RefreshChainDefaultProfile(benchmark::State& state) {
-    fullChain(state, Sim::loadProfile(Sim::defaultProfilePath()));
+// What a provider does to show the sensor list: no exchange at all.
+void BM_CachedSensorsWithReadings(benchmark::State& state) {
+    if (!prepare(state, server(state))) return;
+    sim().resetCounters();
+    for (auto _ : state) {
+        for (const auto& sensor : IpmiIfc::getSensors(0)) benchmark::DoNotOptimize(sensor->getCachedState());
+    }
+    state.counters["exchanges"] = static_cast<double>(sim().totalExchanges());
+    state.counters["sensors"] = static_cast<double>(IpmiIfc::getSensors(0).size());
+    finishRun();
 }
-void BM_RefreshChainThousandRecords(benchmark::State& state) { fullChain(state, generatedServer(1000)); }
-void BM_ReadingRefreshDefaultProfile(benchmark::State& state) {
-    readingRefresh(state, Sim::loadProfile(Sim::defaultProfilePath()));
-}
-void BM_ReadingRefreshThousandRecords(benchmark::State& state) { readingRefresh(state, generatedServer(1000)); }
+BENCHMARK(BM_CachedSensorsWithReadings)->Arg(0)->Arg(1000)->Unit(benchmark::kMicrosecond);
 
-BENCHMARK(BM_RefreshChainDefaultProfile)->Unit(benchmark::kMillisecond)->UseRealTime();
-BENCHMARK(BM_RefreshChainThousandRecords)->Unit(benchmark::kMillisecond)->UseRealTime();
-BENCHMARK(BM_ReadingRefreshDefaultProfile)->Unit(benchmark::kMillisecond)->UseRealTime();
-BENCHMARK(BM_ReadingRefreshThousandRecords)->Unit(benchmark::kMillisecond)->UseRealTime();
+// Without latency only: how the chain's exchanges, CPU and heap grow.
+void BM_RefreshChainScaling(benchmark::State& state) {
+    if (!prepare(state, server(state))) return;
+    Bench::cpuOnly(state, forgetEverything, [] { IpmiIfcSdrGetInfo(0); });
+    state.counters["sensors"] = static_cast<double>(IpmiIfc::getSensors(0).size());
+    state.counters["heap_bytes_per_sensor"] = heapPerSensor();
+    finishRun();
+}
+BENCHMARK(BM_RefreshChainScaling)->Arg(100)->Arg(1000)->Arg(4000)->Iterations(3)->Unit(benchmark::kMillisecond);
 
 }  // namespace

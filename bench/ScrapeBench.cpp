@@ -22,6 +22,7 @@
 #include "GeneratedServer.h"
 #include "IpmiIfc.h"
 #include "IpmiIfcInternal.h"
+#include "BenchSupport.h"
 #include "Metrics.h"
 #include "Sim.h"
 
@@ -32,7 +33,7 @@ using namespace Ipmi;
 // 1,250 records: 1,000 sensors and 250 FRU locators.
 constexpr size_t kRecords = 1250;
 
-Sim::Simulator& sim() { return Sim::Simulator::instance(); }
+using Bench::sim;
 
 void scrapeBesideLoop(benchmark::State& state, bool busyLoop) {
     sim().install(Bench::generatedServer(kRecords), busyLoop);

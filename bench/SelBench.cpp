@@ -1,70 +1,35 @@
-// The SEL against the simulated controller in virtual time, no latency:
+// The SEL against the simulated controller, each operation against the bare
+// client's replay of its requests (BenchSupport.h):
 //
-// - loading a 3,000-record log at start (the first Get SEL Info answer);
-// - one poll pass that finds one new record;
-// - the direct synchroniser reading the same log.
+// - loading a 3,000-record log at start (the first Get SEL Info answer), and
+//   the heap each record held costs;
+// - one poll pass that finds one new record and hands it to a handler;
+// - the direct synchroniser reading the same log;
+// - the load at 100, 1,000 and 4,000 records, for how its cost grows.
 //
-// Reported: exchanges (checked against what the algorithm must ask), CPU per
-// exchange of the library (process CPU time minus the CPU time of replaying
-// the same requests through the simulator's fault layer and command table),
-// and the heap each record held costs, counted by the operator new below.
+// Exchange counts are checked against what the algorithm must ask.
 
 #include <benchmark/benchmark.h>
-#include <malloc.h>
 #include <stdlib.h>
-#include <string.h>
-#include <time.h>
 
-#include <atomic>
 #include <memory>
-#include <new>
 #include <string>
 #include <vector>
 
+#include "BenchSupport.h"
 #include "Bmc.h"
 #include "IpmiIfcInternal.h"
 #include "IpmiSel.h"
 #include "IpmiSelData.h"
 #include "Sim.h"
 
-// Live heap bytes of the process, as malloc accounts them. GCC cannot see
-// that these new and delete pair malloc with free.
-#pragma GCC diagnostic ignored "-Wmismatched-new-delete"
-static std::atomic<long long> g_liveBytes{0};
-
-void* operator new(size_t size) {
-    void* p = malloc(size ? size : 1);
-    if (p == nullptr) throw std::bad_alloc();
-    g_liveBytes += static_cast<long long>(malloc_usable_size(p));
-    return p;
-}
-void operator delete(void* p) noexcept {
-    if (p == nullptr) return;
-    g_liveBytes -= static_cast<long long>(malloc_usable_size(p));
-    free(p);
-}
-void operator delete(void* p, size_t) noexcept { operator delete(p); }
-
 namespace {
 
 using namespace Ipmi;
+using Bench::sim;
 
 constexpr size_t kRecords = 3000;
 constexpr size_t kRecordBytes = 16;
-
-Sim::Simulator& sim() { return Sim::Simulator::instance(); }
-
-double processCpuSeconds() {
-    timespec ts;
-    clock_gettime(CLOCK_PROCESS_CPUTIME_ID, &ts);
-    return static_cast<double>(ts.tv_sec) + static_cast<double>(ts.tv_nsec) / 1e9;
-}
-
-double simulatorCpuSeconds(const std::vector<Sim::Request>& requests) {
-    const double start = processCpuSeconds();
-    for (const Sim::Request& r : requests) benchmark::DoNotOptimize(sim().exchange(r, nullptr));
-    return processCpuSeconds() - start;
-}
 
 void logEvent(Sim::Bmc& bmc, uint16_t serial) {
     const uint8_t record[kRecordBytes] = {0,    0,    0x02, 0, 0, 0, 0, 0x20, 0x00, 0x04, 0x01, 0x30, 0x01, 0x07,
@@ -72,11 +37,11 @@ void logEvent(Sim::Bmc& bmc, uint16_t serial) {
     Sim::addSelRecord(bmc, record);
 }
 
-std::shared_ptr<Sim::Bmc> generatedLog() {
+std::shared_ptr<Sim::Bmc> generatedLog(size_t records) {
     auto bmc = std::make_shared<Sim::Bmc>();
     bmc->sel.allocationUnits = 0xFFFF;
     bmc->sel.eraseTimestamp = 1;  // erased once: the first answer reloads
-    for (size_t i = 0; i < kRecords; ++i) logEvent(*bmc, static_cast<uint16_t>(i));
+    for (size_t i = 0; i < records; ++i) logEvent(*bmc, static_cast<uint16_t>(i));
     return bmc;
 }
 
@@ -96,112 +61,111 @@ void forgetSel() {
     gone.swap(g_IpmiNode[0].selRecords);
 }
 
-struct Figures {
-    double exchanges = 0, cpu = 0, simCpu = 0;
-    long runs = 0;
-    void report(benchmark::State& state) const {
-        if (runs == 0) return;
-        state.counters["exchanges"] = exchanges / static_cast<double>(runs);
-        state.counters["lib_cpu_us_per_exchange"] = (cpu - simCpu) / exchanges * 1e6;
-    }
-};
+void closeNode() {
+    forgetSel();
+    IpmiIfcOpenIpmiClose(0);
+    sim().uninstall();
+}
 
-// Runs `work` timed; `expected` exchanges or the benchmark stops with an error.
-template <class Work>
-bool measured(benchmark::State& state, Figures& f, size_t expected, Work work) {
+bool expect(benchmark::State& state, size_t exchanges, size_t needed) {
+    if (exchanges == needed) return true;
+    state.SkipWithError(
+        ("exchanges " + std::to_string(exchanges) + ", the algorithm needs " + std::to_string(needed)).c_str());
+    return false;
+}
+
+// Heap the records of one load hold, per record beyond its 16 bytes.
+double heapPerRecord(size_t records) {
+    forgetSel();
     sim().resetCounters();
-    const double cpu0 = processCpuSeconds();
-    state.ResumeTiming();
-    work();
-    state.PauseTiming();
-    f.cpu += processCpuSeconds() - cpu0;
-    const std::vector<Sim::Request> requests = sim().requests();
-    f.simCpu += simulatorCpuSeconds(requests);
-    f.exchanges += static_cast<double>(requests.size());
-    ++f.runs;
-    if (requests.size() != expected) {
-        state.SkipWithError(("exchanges " + std::to_string(requests.size()) + ", the algorithm needs " +
-                             std::to_string(expected)).c_str());
-        return false;
-    }
-    return true;
+    const long long before = Bench::liveHeapBytes();
+    IpmiIfcSelGetInfo(0, nullptr);
+    sim().resetCounters();  // the simulator's request log is not the library's
+    const size_t held = IpmiIfc::getSelData().size();
+    return held == records ? static_cast<double>(Bench::liveHeapBytes() - before) / static_cast<double>(records) -
+                                 static_cast<double>(kRecordBytes)
+                           : -1;
 }
 
 // Get SEL Info, Reserve SEL, one Get SEL Entry per record.
 void BM_SelLoadAtStart(benchmark::State& state) {
-    auto bmc = generatedLog();
-    openNode(bmc);
-    Figures f;
-    long long perRecord = 0;
-    for (auto _ : state) {
-        state.PauseTiming();
-        forgetSel();
-        const long long before = g_liveBytes.load();
-        if (!measured(state, f, 2 + kRecords, [] { IpmiIfcSelGetInfo(0, nullptr); })) break;
-        if (IpmiIfc::getSelData().size() != kRecords) {
-            state.SkipWithError("the log did not load");
+    openNode(generatedLog(kRecords));
+    Bench::Versus v(2);
+    for (auto _ : state)
+        if (!v.add(state, forgetSel, [] { IpmiIfcSelGetInfo(0, nullptr); }) ||
+            !expect(state, v.lastExchanges(), 2 + kRecords))
             break;
-        }
-        perRecord = (g_liveBytes.load() - before) / static_cast<long long>(kRecords);
-        state.ResumeTiming();
-    }
-    f.report(state);
-    state.counters["heap_bytes_per_record"] = static_cast<double>(perRecord);
-    forgetSel();
-    IpmiIfcOpenIpmiClose(0);
-    sim().uninstall();
+    v.report(state);
+    state.counters["heap_bytes_per_record_beyond_16"] = heapPerRecord(kRecords);
+    closeNode();
+}
+BENCHMARK(BM_SelLoadAtStart)->Unit(benchmark::kMillisecond)->Iterations(2);
+
+void countRecord(void* context, IpmiSelData* record) {
+    if (record != nullptr) ++*static_cast<size_t*>(context);
 }
 
-// Get SEL Info, Reserve SEL, the last record held again, the new one.
-void BM_SelPollFindsOneRecord(benchmark::State& state) {
-    auto bmc = generatedLog();
+// Get SEL Info, Reserve SEL, the last record held again, the new one, which a
+// registered handler receives; in a log of range(0) records, since delivery
+// looks at every record held for those stamped after the last addition.
+void BM_SelRecordDelivered(benchmark::State& state) {
+    auto bmc = generatedLog(static_cast<size_t>(state.range(0)));
     openNode(bmc);
     IpmiIfcSelGetInfo(0, nullptr);
-    Figures f;
+    size_t delivered = 0;
+    IpmiIfc::registerSelEventHandler(0, countRecord, &delivered);
+    Bench::Versus v(10);
     uint16_t serial = 0;
-    for (auto _ : state) {
-        state.PauseTiming();
-        bmc->sel.clockOffset += 1;
-        logEvent(*bmc, ++serial);
-        if (!measured(state, f, 4, [] { IpmiIfcSelGetInfo(0, nullptr); })) break;
-        state.ResumeTiming();
-    }
-    f.report(state);
-    forgetSel();
-    IpmiIfcOpenIpmiClose(0);
-    sim().uninstall();
+    auto logOne = [&] {
+        sim().withBmc([&](Sim::Bmc& b) {
+            b.sel.clockOffset += 1;
+            logEvent(b, ++serial);
+        });
+    };
+    for (auto _ : state)
+        if (!v.add(state, logOne, [] { IpmiIfcSelGetInfo(0, nullptr); }) || !expect(state, v.lastExchanges(), 4))
+            break;
+    v.report(state);
+    // Every run of the library, warm-up included, finds its one record.
+    state.counters["delivered_per_pass"] =
+        static_cast<double>(delivered) / static_cast<double>(1 + 11 * state.iterations());
+    IpmiIfc::unRegisterSelEventHandler(0, countRecord);
+    closeNode();
 }
+BENCHMARK(BM_SelRecordDelivered)->Arg(100)->Arg(kRecords)->Unit(benchmark::kMicrosecond)->Iterations(300);
 
 // Get SEL Info, Reserve SEL, one Get SEL Entry per record (the greeting
 // comes once per process, before the first run).
 void BM_SelSyncDeviceEventlog(benchmark::State& state) {
-    auto bmc = generatedLog();
-    sim().install(bmc, true);
+    sim().install(generatedLog(kRecords), true);
     sim().clearFaults();
     sel_state warm = {};
     Event_log* records = nullptr;
     int n = 0;
     sync_device_eventlog(&records, &n, &warm);  // greets the controller
     free(records);
-    Figures f;
-    for (auto _ : state) {
-        state.PauseTiming();
+    Bench::Versus v(2);
+    auto sync = [&] {
         sel_state fresh = {};
         n = 0;
-        if (!measured(state, f, 2 + kRecords, [&] { sync_device_eventlog(&records, &n, &fresh); })) break;
+        sync_device_eventlog(&records, &n, &fresh);
         free(records);
-        if (static_cast<size_t>(n) != kRecords) {
-            state.SkipWithError("the log did not load");
-            break;
-        }
-        state.ResumeTiming();
-    }
-    f.report(state);
+    };
+    for (auto _ : state)
+        if (!v.add(state, [] {}, sync) || !expect(state, v.lastExchanges(), 2 + kRecords)) break;
+    v.report(state);
     sim().uninstall();
 }
+BENCHMARK(BM_SelSyncDeviceEventlog)->Unit(benchmark::kMillisecond)->Iterations(2);
 
-BENCHMARK(BM_SelLoadAtStart)->Unit(benchmark::kMillisecond)->Iterations(20);
-BENCHMARK(BM_SelPollFindsOneRecord)->Unit(benchmark::kMicrosecond)->Iterations(2000);
-BENCHMARK(BM_SelSyncDeviceEventlog)->Unit(benchmark::kMillisecond)->Iterations(20);
+// Without latency only: how the load's exchanges, CPU and heap grow.
+void BM_SelLoadScaling(benchmark::State& state) {
+    const auto records = static_cast<size_t>(state.range(0));
+    openNode(generatedLog(records));
+    Bench::cpuOnly(state, forgetSel, [] { IpmiIfcSelGetInfo(0, nullptr); });
+    state.counters["heap_bytes_per_record_beyond_16"] = heapPerRecord(records);
+    closeNode();
+}
+BENCHMARK(BM_SelLoadScaling)->Arg(100)->Arg(1000)->Arg(4000)->Iterations(3)->Unit(benchmark::kMillisecond);
 
 }  // namespace

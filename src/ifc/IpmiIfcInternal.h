@@ -132,6 +132,18 @@ private:
 extern int SKIP_SDR_STEP;
 extern int SKIP_FRU_STEP;
 
+// What the polling loop keeps from pass to pass.
+struct IpmiLoopState {
+    uint16_t entryCount = 0;
+    uint16_t lastEntryCount = 0;
+    int sdrCycle = 2;
+    bool fullRefresh = false;
+};
+
+// One pass of the polling loop after a wake-up, with pollMutex held and
+// pollCount already advanced. False: the node is stopping.
+bool IpmiIfcPollPass(int node, IpmiLoopState& s);
+
 // SDR repository. sdr_mutex serialises the refresh chain of every node.
 extern TAV::Mutex sdr_mutex;
 uint32_t IpmiIfcRhGetSdrInfo(ipmiifc_resp* resp);

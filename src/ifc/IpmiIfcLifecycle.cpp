@@ -124,18 +124,10 @@ void sleepUntilWoken(IpmiNode& n) {
     ipmiLog(LOG_DEBUG, "Node %d: IpmiIfc::poll woke up.", 0);
 }
 
-// What the loop keeps from pass to pass.
-struct LoopState {
-    uint16_t entryCount = 0;
-    uint16_t lastEntryCount = 0;
-    int sdrCycle = 2;
-    bool fullRefresh = false;
-};
-
 enum class PassEnd { Continue, Stop };
 
 // Reads the SEL entry count, up to ten times a second apart.
-void readSelCount(IpmiNode& n, LoopState& s) {
+void readSelCount(IpmiNode& n, IpmiLoopState& s) {
     int tries = 0;
     while (tries < kSelInfoTries) {
         if (IpmiIfcSelGetInfo(0, &s.entryCount) == 0) return;
@@ -153,7 +145,7 @@ void refreshFru() {
 }
 
 // One pass after a wake-up (pollCount already advanced).
-PassEnd runPass(IpmiNode& n, LoopState& s) {
+PassEnd runPass(IpmiNode& n, IpmiLoopState& s) {
     readSelCount(n, s);
 
     const int skip = n.pollCount & kPeriodicMask;
@@ -211,13 +203,15 @@ PassEnd runPass(IpmiNode& n, LoopState& s) {
 
 }  // namespace
 
+bool IpmiIfcPollPass(int, IpmiLoopState& s) { return runPass(g_IpmiNode[0], s) == PassEnd::Continue; }
+
 void IpmiIfc::poll(int) {
     IpmiNode& n = g_IpmiNode[0];
     ipmiLog(LOG_DEBUG, "Node %d: IpmiIfc::poll called", 0);
     TAV::MutexLock passLock(n.pollMutex);
 
     // Not guarded: a failure here ends the loop and start.
-    LoopState s;
+    IpmiLoopState s;
     IpmiIfcSelGetInfo(0, &s.entryCount);
     s.lastEntryCount = s.entryCount;
     getLan(0)->IpmiIfcLanInstantiate(0);
@@ -235,7 +229,7 @@ void IpmiIfc::poll(int) {
         if (stopping(n)) break;
         n.pollCount += 1;
         try {
-            if (runPass(n, s) == PassEnd::Stop) break;
+            if (!IpmiIfcPollPass(0, s)) break;
         } catch (...) {
             rethrowIfUnwinding();
             ipmiLog(LOG_ERR, "IPMI polling thread caught exception while polling node %d", 0);

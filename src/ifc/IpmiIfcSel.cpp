@@ -465,15 +465,19 @@ int IpmiIfcRhSelInfoNoCount(ipmiifc_resp* resp) { return static_cast<int>(IpmiIf
 uint32_t IpmiIfcSelGenerateEvents(int node, uint32_t sinceTimestamp) {
     if (_getState(0) == IpmiIfc::IPMI_STATE_CLI) return 0;
     IpmiNode& n = slot(node);
+    auto due = [sinceTimestamp](const IpmiSelData& r) {
+        return r.isSelEventRecord() && (r.messageTimeStamp() > sinceTimestamp || sinceTimestamp == 0xFFFFFFFF);
+    };
     for (size_t i = 0;; ++i) {
         std::shared_ptr<IpmiSelData> record;
         {
+            // Records not due are passed over under one lock: a log of
+            // thousands mostly holds records delivered long ago.
             TAV::MutexLock guard(n.selMutex);
+            while (i < n.selRecords.size() && !due(*n.selRecords[i])) ++i;
             if (i >= n.selRecords.size()) return 0;
             record = n.selRecords[i];
         }
-        if (!record->isSelEventRecord()) continue;
-        if (record->messageTimeStamp() <= sinceTimestamp && sinceTimestamp != 0xFFFFFFFF) continue;
         IpmiIfcSelCallHandlers(record.get());
     }
 }

@@ -22,9 +22,20 @@ void setLogSink(IpmiLogSink sink, void* context) {
 }
 
 void ipmiLog(int priority, const char* format, ...) {
+    const int callerErrno = errno;  // for "%m"
+    bool sinkSet;
+    {
+        std::lock_guard<std::mutex> guard(sinkMutex);
+        sinkSet = sinkFn != nullptr;
+    }
+    // A priority the process's log mask drops costs no formatting: the
+    // exchange paths log at debug, which production hosts mask.
+    if (!sinkSet && (setlogmask(0) & LOG_MASK(LOG_PRI(priority))) == 0) return;
+
     char text[1024];
     va_list args;
     va_start(args, format);
+    errno = callerErrno;
     vsnprintf(text, sizeof text, format, args);  // glibc expands %m like syslog
     va_end(args);
     {
