@@ -33,7 +33,7 @@
 namespace {
 
 using namespace Ipmi;
-using Bench::generatedServer;
+using Sim::generatedServer;
 
 constexpr int64_t kLatencyUs = 1000;
 

@@ -35,7 +35,7 @@ constexpr size_t kRecords = 1250;
 Sim::Simulator& sim() { return Sim::Simulator::instance(); }
 
 void scrapeBesideLoop(benchmark::State& state, bool busyLoop) {
-    sim().install(Bench::generatedServer(kRecords), busyLoop);
+    sim().install(Sim::generatedServer(kRecords), busyLoop);
     sim().clearFaults();
     sim().setLatencyUs(0);
     InitIpmiNode(0);
