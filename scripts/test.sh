@@ -32,6 +32,8 @@ echo "== benchmarks (short run)"
 for b in build/bench/*-bench; do
   [ -x "$b" ] && "$b" --benchmark_min_time=0.01
 done
+# The library beside ipmitool and FreeIPMI, briefly: that the comparison runs.
+bench/peers.sh --quick --build build
 
 echo "== AddressSanitizer + UndefinedBehaviorSanitizer"
 build build-asan -DTAV_IPMI_SANITIZE=address,undefined -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=OFF \
