@@ -165,15 +165,17 @@ for profile in "${wanted[@]}"; do
     done
 
     # Theirs. FreeIPMI keeps its SDR cache in a directory: empty for the cold
-    # run, then warm for the readings, the SEL and the FRU.
+    # run, then warm for the readings, the SEL and the FRU. ipmi-sensors reads
+    # the sensors of the controllers behind the BMC only when asked to, as
+    # ipmitool and the library always do.
     cache=$work/sdr-cache
     rm -rf "$cache"
     mkdir "$cache"
     freeipmi=(--driver-type=OPENIPMI --sdr-cache-directory="$cache" --quiet-cache)
     peer elist 0 ipmitool -I open sdr elist
     peer sensor 0 ipmitool -I open sensor
-    peer sensors-cold 0 ipmi-sensors "${freeipmi[@]}"
-    peer sensors-warm 0 ipmi-sensors "${freeipmi[@]}"
+    peer sensors-cold 0 ipmi-sensors "${freeipmi[@]}" --bridge-sensors
+    peer sensors-warm 0 ipmi-sensors "${freeipmi[@]}" --bridge-sensors
     # An empty log is no failure: ipmitool says so, ipmi-sel prints nothing.
     peer sel-elist 1 ipmitool -I open sel elist
     sel_label=SEL
