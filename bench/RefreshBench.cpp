@@ -37,7 +37,7 @@ void forgetEverything() {
 
 std::shared_ptr<Sim::Bmc> server(benchmark::State& state) {
     if (state.range(0) == 0) return Sim::loadProfile(Sim::defaultProfilePath());
-    return Bench::generatedServer(static_cast<size_t>(state.range(0)));
+    return Sim::generatedServer(static_cast<size_t>(state.range(0)));
 }
 
 // The node open on `bmc` with its repository read, or false with the reason.

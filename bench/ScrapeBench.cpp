@@ -36,7 +36,7 @@ constexpr size_t kRecords = 1250;
 using Bench::sim;
 
 void scrapeBesideLoop(benchmark::State& state, bool busyLoop) {
-    sim().install(Bench::generatedServer(kRecords), busyLoop);
+    sim().install(Sim::generatedServer(kRecords), busyLoop);
     sim().clearFaults();
     sim().setLatencyUs(0);
     InitIpmiNode(0);

@@ -91,7 +91,8 @@ void clearSelRecords(Bmc& bmc);
 // Throws std::runtime_error("file: message") when it cannot be read or is cut short.
 void loadSelDump(Bmc& bmc, const std::string& path);
 
-// Builds a controller from an ipmi_sim emulator command file.
+// Builds a controller from an ipmi_sim emulator command file, or the generated
+// large server that "generated:N" names (GeneratedServer.h).
 // Throws std::runtime_error("file:line: message") on a syntax error.
 std::shared_ptr<Bmc> loadProfile(const std::string& path);
 // The project's own profile of a plausible server.

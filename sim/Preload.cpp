@@ -1,15 +1,26 @@
-// LD_PRELOAD entry: other programs (ipmitool, FreeIPMI) see the simulated
-// controller named by TAV_IPMI_SIM_PROFILE ("default" for the project's own).
-// A raw FRU image (a name ending in ".bin") is served as FRU device 0 of
-// the default controller. TAV_IPMI_SIM_COUNTS=FILE writes, at exit, how many
-// requests of each command the controller answered ("netfn cmd count" lines,
-// hexadecimal netfn and cmd). TAV_IPMI_SIM_VIRTUAL_TIME=1 makes their sleeps
-// and time-outs virtual. TAV_IPMI_SIM_CONTROL=1 lets a test steer a running
-// program's simulator by signals: SIGUSR1 adds an event to the SEL, SIGUSR2
-// prints the exchanges so far per command on stderr.
+// LD_PRELOAD entry: other programs (ipmitool, FreeIPMI, the tool, client
+// programs) see the simulated controller named by TAV_IPMI_SIM_PROFILE:
+// "default" for the project's own, a profile file (see loadProfile), or
+// "generated:N" for a generated large server of N SDR records. A raw FRU
+// image (a name ending in ".bin") is served as FRU device 0 of the default
+// controller. A profile that cannot be had stops the program with the reason.
+//
+// TAV_IPMI_SIM_LATENCY_US=N makes every answer take N microseconds of real
+// time, as a controller behind a slow interface does.
+// TAV_IPMI_SIM_VIRTUAL_TIME=1 makes the program's sleeps and time-outs
+// virtual instead.
+// TAV_IPMI_SIM_COUNTS=FILE writes, at exit, how many requests of each command
+// the controller answered ("netfn cmd count" lines, hexadecimal netfn and
+// cmd), then "total N". A program can read the total between its own
+// operations through tavIpmiSimTotalExchanges (dlsym(RTLD_DEFAULT, ...)).
+// TAV_IPMI_SIM_CONTROL=1 lets a test steer a running program's simulator by
+// signals: SIGUSR1 adds an event to the SEL, SIGUSR2 prints the exchanges so
+// far per command on stderr.
 
+#include <errno.h>
 #include <pthread.h>
 #include <signal.h>
+#include <stdint.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -31,6 +42,11 @@ extern "C" __attribute__((visibility("default"))) int tavIpmiSimAddSelEvent(cons
     int id = 0;
     Sim::Simulator::instance().withBmc([&](Sim::Bmc& b) { id = Sim::addSelRecord(b, record); });
     return id;
+}
+
+// Requests the controller has answered since the program started.
+extern "C" __attribute__((visibility("default"))) unsigned tavIpmiSimTotalExchanges() {
+    return Sim::Simulator::instance().totalExchanges();
 }
 
 namespace {
@@ -80,9 +96,27 @@ void startControl() {
     if (pthread_create(&thread, nullptr, controlThread, &signals) == 0) pthread_detach(thread);
 }
 
+// The latency from the environment: none when unset; a bad value stops the
+// program, since its timings would mean nothing.
+int64_t latencyFromEnvironment() {
+    const char* text = getenv("TAV_IPMI_SIM_LATENCY_US");
+    if (text == nullptr || *text == '\0') return 0;
+    char* end = nullptr;
+    errno = 0;
+    const long long us = strtoll(text, &end, 10);
+    constexpr long long kMaxUs = 10 * 1000 * 1000;  // ten seconds an answer: past any driver's time-out
+    if (errno != 0 || *end != '\0' || us < 0 || us > kMaxUs) {
+        fprintf(stderr, "tav-ipmi simulator: TAV_IPMI_SIM_LATENCY_US=%s: not a latency of 0 to %lld microseconds\n",
+                text, kMaxUs);
+        _exit(2);
+    }
+    return us;
+}
+
 __attribute__((constructor)) void installFromEnvironment() {
     const char* profile = getenv("TAV_IPMI_SIM_PROFILE");
     if (profile == nullptr || *profile == '\0') return;
+    Sim::Simulator::instance().setLatencyUs(latencyFromEnvironment());
     const std::string name(profile);
     const bool fruImage = name.size() > 4 && name.compare(name.size() - 4, 4, ".bin") == 0;
     std::string path = name == "default" || fruImage ? Sim::defaultProfilePath() : name;
@@ -107,6 +141,7 @@ __attribute__((destructor)) void reportCounts() {
     FILE* out = fopen(path, "w");
     if (out == nullptr) return;
     printCounters(out, "%02x %02x %u\n");
+    fprintf(out, "total %u\n", Sim::Simulator::instance().totalExchanges());
     fclose(out);
 }
 

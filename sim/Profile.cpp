@@ -32,6 +32,7 @@
 #include <vector>
 
 #include "Bmc.h"
+#include "GeneratedServer.h"
 #include "IpmiCommands.h"
 #include "SdrLayout.h"
 
@@ -574,6 +575,8 @@ bool endsWith(const std::string& s, const std::string& tail) {
 }  // namespace
 
 std::shared_ptr<Bmc> loadProfile(const std::string& path) {
+    size_t records = 0;
+    if (generatedProfile(path, records)) return generatedServer(records);
     auto bmc = std::make_shared<Bmc>();
     if (endsWith(path, ".sdr")) {
         loadSdrDump(*bmc, path);

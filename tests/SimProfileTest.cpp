@@ -7,8 +7,10 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <set>
 #include <stdexcept>
 
+#include "SdrLayout.h"
 #include "TestSupport.h"
 
 using namespace Ipmi;
@@ -229,6 +231,33 @@ TEST(SimProfile, TheDefaultServerLoads) {
     auto bmc = Sim::loadProfile(Sim::defaultProfilePath());  // other tests skip a profile that does not load
     EXPECT_FALSE(bmc->sensors.empty());
     EXPECT_EQ(bmc->fru.devices.size(), 2u);
+}
+
+// A large server by name: every sensor record has a key of its own (the
+// controllers past the BMC answer on IPMB), a SEL of half as many events up
+// to the log's size, and the default server's FRU devices.
+TEST(SimProfile, GeneratedServersByName) {
+    auto bmc = Sim::loadProfile("generated:4000");
+    ASSERT_EQ(bmc->sdr.records.size(), 4000u);
+    std::set<std::pair<uint8_t, uint8_t>> keys;
+    size_t sensorRecords = 0;
+    for (const auto& r : bmc->sdr.records) {
+        if (r[3] == sdr::type::fruDeviceLocator) continue;
+        ++sensorRecords;
+        keys.emplace(r[sdr::key::ownerId], r[sdr::key::sensorNumber]);
+    }
+    EXPECT_EQ(keys.size(), sensorRecords);
+    EXPECT_EQ(keys.rbegin()->first, 0x2C + 2 * 14);
+    Sim::Request viaIpmb{netfn::sensorEvent, cmd::getSensorReading, 0, 0, 0x2E, true, {0}};
+    EXPECT_EQ(bmc->handle(viaIpmb)[0], cc::ok);
+    EXPECT_EQ(bmc->sel.records.size(), 1024u);
+    EXPECT_EQ(Sim::loadProfile("generated:9")->sel.records.size(), 4u);
+    EXPECT_EQ(bmc->fru.devices.size(), 2u);
+
+    EXPECT_EQ(loadError("generated:0"), "generated:0: a generated server has 1 to 8000 SDR records");
+    EXPECT_EQ(loadError("generated:8001"), "generated:8001: a generated server has 1 to 8000 SDR records");
+    EXPECT_EQ(loadError("generated:1k"), "generated:1k: a generated server has 1 to 8000 SDR records");
+    EXPECT_EQ(Sim::loadProfile("generated:8000")->sdr.records.size(), 8000u);
 }
 
 }  // namespace

@@ -139,7 +139,8 @@ int main(int argc, char** argv) {
     std::string profile;
     app.add_option("--simulate", profile,
                    "talk to the simulated BMC: its default server, an ipmi_sim .emu, raw .sdr or SEL file, "
-                   "or the default server with a raw FRU image (.bin) as FRU device 0")
+                   "the default server with a raw FRU image (.bin) as FRU device 0, or generated:N, "
+                   "a large server of N SDR records")
         ->expected(0, 1)
         ->default_str("default");
     Tool::Format format = Tool::Format::Table;
