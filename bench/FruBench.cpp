@@ -145,6 +145,6 @@ void BM_FruDiscovery(benchmark::State& state) {
     state.counters["devices"] = static_cast<double>(IpmiIfc::getFrus(0).size());
     finish();
 }
-BENCHMARK(BM_FruDiscovery)->Iterations(4)->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_FruDiscovery)->Iterations(20)->Unit(benchmark::kMillisecond);
 
 }  // namespace

@@ -96,7 +96,8 @@ void BM_ReadingRefresh(benchmark::State& state) {
     v.report(state);
     finishRun();
 }
-BENCHMARK(BM_ReadingRefresh)->Arg(0)->Arg(1000)->Iterations(4)->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_ReadingRefresh)->Arg(0)->Iterations(20)->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_ReadingRefresh)->Arg(1000)->Iterations(4)->Unit(benchmark::kMillisecond);
 
 // range(1): 1 for the pass the loop makes seven times in eight (the SEL count
 // read, nothing new), 8 for the periodic one.
@@ -124,8 +125,8 @@ void BM_PollPass(benchmark::State& state) {
                    (state.range(0) == 0 ? "default profile" : std::to_string(state.range(0)) + " records"));
     finishRun();
 }
-BENCHMARK(BM_PollPass)->Args({0, 1})->Args({1000, 1})->Iterations(200)->Unit(benchmark::kMicrosecond);
-BENCHMARK(BM_PollPass)->Args({0, 8})->Iterations(10)->Unit(benchmark::kMicrosecond);
+BENCHMARK(BM_PollPass)->Args({0, 1})->Args({1000, 1})->Iterations(1000)->Unit(benchmark::kMicrosecond);
+BENCHMARK(BM_PollPass)->Args({0, 8})->Iterations(20)->Unit(benchmark::kMicrosecond);
 
 // What a provider does to show the sensor list: no exchange at all.
 void BM_CachedSensorsWithReadings(benchmark::State& state) {
