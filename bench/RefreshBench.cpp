@@ -149,6 +149,6 @@ void BM_RefreshChainScaling(benchmark::State& state) {
     state.counters["heap_bytes_per_sensor"] = heapPerSensor();
     finishRun();
 }
-BENCHMARK(BM_RefreshChainScaling)->Arg(100)->Arg(1000)->Arg(4000)->Iterations(3)->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_RefreshChainScaling)->Arg(100)->Arg(1000)->Arg(4000)->Iterations(10)->Unit(benchmark::kMillisecond);
 
 }  // namespace
