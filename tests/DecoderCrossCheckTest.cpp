@@ -346,23 +346,8 @@ std::vector<std::string> allProfiles() {
     return all;
 }
 
-std::string profileTestName(const ::testing::TestParamInfo<std::string>& info) {
-    std::string name = info.param == "default" ? "default" : info.param.substr(info.param.rfind('/') + 1);
-    for (char& c : name)
-        if (!isalnum(static_cast<unsigned char>(c))) c = '_';
-    return name;
-}
-
 class DecoderCrossCheck : public TestSupport::SimTest {
 protected:
-    void TearDown() override {
-        IpmiIfcSdrCleanUpAll(0);
-        IpmiIfcSdrCleanUpHeaders(0);
-        IpmiIfcEntityCleanUpAll(0);  // the tree the refresh chain built
-        IpmiIfcSensorInstantiateAll(0);
-        SimTest::TearDown();
-    }
-
     // The library in command-line mode, as the tool runs it, on `profile`.
     std::vector<Ours> libraryOn(const std::string& profile) {
         try {

@@ -99,12 +99,6 @@ TEST(SelRecord, SummaryOfTheLog) {
 
 class SelFollow : public TestSupport::SimTest {
 protected:
-    void TearDown() override {
-        IpmiIfcSdrCleanUpHeaders(0);  // a record's sensor number may have loaded the SDRs
-        IpmiIfcSdrCleanUpAll(0);
-        IpmiIfcEntityCleanUpAll(0);
-        SimTest::TearDown();
-    }
     // Logs an event as a sensor would, stamped by the controller's clock;
     // `serial` makes it unique. Returns its bytes as stored, or empty when full.
     Bytes logEvent(uint16_t serial) {

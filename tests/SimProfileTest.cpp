@@ -37,10 +37,7 @@ private:
     std::string dir_;
 };
 
-Sim::Response ask(Sim::Bmc& bmc, uint8_t netfn, uint8_t cmd, Bytes data = {}) {
-    return bmc.handle(Sim::Request{netfn, cmd, 0, 15, 0x20, false, std::move(data)});
-}
-
+using TestSupport::ask;
 Sim::Response reading(Sim::Bmc& bmc, uint8_t sensor) { return ask(bmc, netfn::sensorEvent, cmd::getSensorReading, {sensor}); }
 
 Bytes fileBytes(const std::string& path) {

@@ -85,6 +85,11 @@ private:
     size_t idAt_;
 };
 
+// The simulated controller's own answer, without the transport; over IPMB
+// when an address is given.
+Sim::Response ask(Sim::Bmc& bmc, uint8_t netfn, uint8_t command, std::vector<uint8_t> data = {},
+                  uint8_t ipmbAddress = 0, uint8_t ipmbChannel = 0);
+
 // IpmiIfc::start(0, interval) on a thread of its own, as a host process runs
 // it. Destruction stops the interface (unless stop() was called) and joins.
 class LoopThread {
@@ -106,6 +111,10 @@ void waitUntil(const std::function<bool()>& done);
 std::string realDataPath(const std::string& relative);
 // Paths of the files in that directory whose names end in `suffix`, sorted; none when absent.
 std::vector<std::string> realDataFiles(const std::string& dir, const std::string& suffix);
+
+// A parameterised test's name for a profile path: its file name, other
+// characters than letters and digits as '_'.
+std::string profileTestName(const ::testing::TestParamInfo<std::string>& info);
 
 #define SKIP_WITHOUT_REAL_DATA(path)                                       \
     do {                                                                   \
