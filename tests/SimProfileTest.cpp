@@ -222,10 +222,4 @@ TEST(SimProfile, RealProfilesLoadAsIpmiSimLoadsThem) {
     }
 }
 
-TEST(SimProfile, TheDefaultServerLoads) {
-    auto bmc = Sim::loadProfile(Sim::defaultProfilePath());  // other tests skip a profile that does not load
-    EXPECT_FALSE(bmc->sensors.empty());
-    EXPECT_EQ(bmc->fru.devices.size(), 2u);
-}
-
 }  // namespace
