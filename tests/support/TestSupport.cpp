@@ -169,6 +169,12 @@ Sim::Response ask(Sim::Bmc& bmc, uint8_t netfn, uint8_t command, std::vector<uin
     return bmc.handle(r);
 }
 
+Ipmi::sel_event_record eventRecord(uint8_t sensorType, uint8_t dirType, uint8_t data1, uint8_t data2, uint8_t data3,
+                             uint8_t recordType, uint8_t evmRev) {
+    return {{0x02, 0x01}, recordType, {0, 0, 0, 0x5F}, {0x20, 0x00}, evmRev, sensorType, 0x30, dirType,
+            {data1, data2, data3}};
+}
+
 LoopThread::LoopThread(int interval)
     : thread_([interval] {
           try {
