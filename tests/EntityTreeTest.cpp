@@ -41,13 +41,6 @@ Bytes sensorRecord(uint8_t type, uint8_t entityId, uint8_t entityInstance) {
 
 class EntityTree : public TestSupport::SimTest {
 protected:
-    void TearDown() override {
-        IpmiIfcEntityCleanUpAll(0);
-        IpmiIfcSdrCleanUpAll(0);
-        IpmiIfcSdrCleanUpHeaders(0);
-        SimTest::TearDown();
-    }
-
     // Files records as the repository reader does, each at the head of its group
     // (a group lists its records last first), then builds the tree from them.
     void tree(const std::vector<Bytes>& records) {

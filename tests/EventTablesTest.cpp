@@ -16,11 +16,7 @@ using namespace Ipmi;
 
 namespace {
 
-// A system event record from the BMC (0x20), sensor 0x30, as a controller would log it.
-Event_log eventRecord(uint8_t sensorType, uint8_t dirType, uint8_t data1, uint8_t data3 = 0xFF) {
-    // record ID, record type, time stamp, generator ID, revision, sensor type and number, direction/type, data
-    return {{0, 0}, SEL_RECORD_TYPE_SYSTEM_EVENT, {}, {0x20, 0}, 0x04, sensorType, 0x30, dirType, {data1, 0xFF, data3}};
-}
+using TestSupport::eventRecord;
 
 std::string describe(const Event_log& r) {
     char line[256];
@@ -68,7 +64,7 @@ TEST(SelDescription, JoinsDirectionSensorTypeNameAndEventTextOldRevisionsGiveNA)
         {eventRecord(0x01, 0x81, 0x02), "Deassert + Temperature Lower Critical going low ",
          "Lower Critical going low "},
         {eventRecord(0x07, 0x6F, 0x01), "Assert + Processor Thermal Trip", "Thermal Trip"},
-        {eventRecord(0x08, 0x6F, 0x06, 0x02), "Assert + Power Supply Config Error: Processor Missing",
+        {eventRecord(0x08, 0x6F, 0x06, 0xFF, 0x02), "Assert + Power Supply Config Error: Processor Missing",
          "Config Error: Processor Missing"},
         // Event data 1 counts whole: flags for event data 2/3 in use miss the text.
         {eventRecord(0x01, 0x01, 0x59), "Assert + Temperature ", ""},

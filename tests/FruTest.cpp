@@ -31,13 +31,6 @@ protected:
         for (size_t i = 0; i < image.size(); ++i) image[i] = static_cast<uint8_t>(i * 7 + 1);
         bmc().fru.devices[1].data = image;
     }
-    void TearDown() override {
-        node().frus.clear();
-        IpmiIfcSdrCleanUpAll(0);
-        IpmiIfcSdrCleanUpHeaders(0);
-        IpmiIfcEntityCleanUpAll(0);
-        SimTest::TearDown();
-    }
     unsigned read(unsigned want, Bytes* out = nullptr, uint8_t word = 0) {
         Bytes buffer(want);
         unsigned length = want;

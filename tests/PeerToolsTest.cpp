@@ -102,8 +102,7 @@ TEST_P(PeerToolsReference, FreeIpmiReadsTheSensorsAsTheReference) {
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(PeerTools, PeerToolsReference, ::testing::ValuesIn(referenceSets()),
-                         [](const ::testing::TestParamInfo<std::string>& p) { return setName(p.param); });
+INSTANTIATE_TEST_SUITE_P(PeerTools, PeerToolsReference, ::testing::ValuesIn(referenceSets()), profileTestName);
 GTEST_ALLOW_UNINSTANTIATED_PARAMETERIZED_TEST(PeerToolsReference);
 
 TEST(PeerTools, IpmitoolDecodesTheDefaultServer) {

@@ -66,12 +66,6 @@ IpmiSdrGroup expectedGroup(uint8_t type) {
 
 class SdrReader : public TestSupport::SimTest {
 protected:
-    void TearDown() override {
-        IpmiIfcSdrCleanUpAll(0);
-        IpmiIfcSdrCleanUpHeaders(0);
-        IpmiIfcEntityCleanUpAll(0);  // the chain builds the entity tree too
-        SimTest::TearDown();
-    }
     void setRepository(std::vector<Bytes> records) { bmc().sdr.records = std::move(records); }
 
     // One group's records as filed, head first; each entry's id and type are its record's.
@@ -471,13 +465,7 @@ TEST_F(SdrReader, RealRepositoriesAreFiledWhole) {
 // ---------------------------------------------------------------------------
 // What the simulated repository answers beyond what the reader asks
 
-Sim::Response ask(Sim::Bmc& bmc, uint8_t netfn, uint8_t command, Bytes data = {}) {
-    Sim::Request r;
-    r.netfn = netfn;
-    r.cmd = command;
-    r.data = std::move(data);
-    return bmc.handle(r);
-}
+using TestSupport::ask;
 
 TEST(SimSdr, RepositoryCommandsCheckTheirRequests) {
     Sim::Bmc bmc;

@@ -8,8 +8,6 @@
 #include <stdlib.h>
 #include <time.h>
 
-#include <algorithm>
-
 #include "PeerTools.h"
 #include "TestSupport.h"
 
@@ -25,11 +23,6 @@ struct Row {
     std::string type;    // sensor type name
     std::string event;   // event text
 };
-
-std::string lower(std::string s) {
-    std::transform(s.begin(), s.end(), s.begin(), [](unsigned char c) { return static_cast<char>(tolower(c)); });
-    return s;
-}
 
 // Texts where a peer says the same thing in other words than the library's
 // event tables (and the sensor type names they share).
@@ -53,54 +46,43 @@ std::string timeText(const std::string& text, const char* format) {
     return out;
 }
 
+// Where each tool prints what, by field between the '|'s.
+struct Layout {
+    size_t fields;
+    bool exactly;  // or at least that many
+    int idBase;
+    int date, clock;  // clock -1: the date field has the time too
+    const char* timeFormat;
+    int sensor;  // -1: no sensor number
+    const char* sensorMark;
+    size_t numberAfterMark;
+    int sensorBase;
+    int type;
+    bool canonicalType;  // our caption is compared by containment as it stands
+    int event;
+};
+
 // "  0004 | 2025-11-24 07:33:48 | Inlet Temp #0x01 | Assert + Temperature Upper ... | major | Upper ..."
-std::vector<Row> ourRows(const std::string& out) {
-    std::vector<Row> rows;
-    for (const auto& line : lines(out)) {
-        auto f = split(line, '|');
-        if (f.size() != 6 || trim(f[0]) == "ID") continue;
-        Row r;
-        r.id = strtol(trim(f[0]).c_str(), nullptr, 10);
-        r.time = trim(f[1]);
-        const size_t hash = f[2].find("#0x");
-        if (hash != std::string::npos) r.sensor = strtol(f[2].c_str() + hash + 1, nullptr, 16);
-        r.type = trim(f[3]);  // the caption: compared by containment
-        r.event = canonical(f[5]);
-        rows.push_back(r);
-    }
-    return rows;
-}
-
+const Layout kOurs{6, true, 10, 1, -1, "%Y-%m-%d %H:%M:%S", 2, "#0x", 1, 16, 3, false, 5};
 // "   4 | 11/24/25 | 07:33:48 UTC | Temperature Inlet Temp | Upper Non-critical going high | Asserted | ..."
-std::vector<Row> ipmitoolRows(const std::string& out) {
-    std::vector<Row> rows;
-    for (const auto& line : lines(out)) {
-        auto f = split(line, '|');
-        if (f.size() < 6) continue;
-        Row r;
-        r.id = strtol(trim(f[0]).c_str(), nullptr, 16);
-        std::string clock = trim(f[2]);
-        r.time = timeText(trim(f[1]) + " " + clock.substr(0, clock.find(' ')), "%m/%d/%y %H:%M:%S");
-        r.type = canonical(trim(f[3]));  // type name, then the sensor name
-        r.event = canonical(f[4]);
-        rows.push_back(r);
-    }
-    return rows;
-}
-
+const Layout kIpmitool{6, false, 16, 1, 2, "%m/%d/%y %H:%M:%S", -1, "", 0, 0, 3, true, 4};
 // "4 | Nov-24-2025 | 07:33:48 | Sensor #1 | Temperature | Upper Non-critical - going high ; ..."
-std::vector<Row> freeIpmiRows(const std::string& out) {
+const Layout kFreeIpmi{6, true, 10, 1, 2, "%b-%d-%Y %H:%M:%S", 3, "Sensor #", 8, 10, 4, true, 5};
+
+std::vector<Row> rowsOf(const std::string& out, const Layout& l) {
     std::vector<Row> rows;
     for (const auto& line : lines(out)) {
-        auto f = split(line, '|');
-        if (f.size() != 6 || trim(f[0]) == "ID") continue;
+        const auto f = split(line, '|');
+        if (f.size() < l.fields || (l.exactly && f.size() != l.fields) || trim(f[0]) == "ID") continue;
         Row r;
-        r.id = strtol(trim(f[0]).c_str(), nullptr, 10);
-        r.time = timeText(trim(f[1]) + " " + trim(f[2]), "%b-%d-%Y %H:%M:%S");
-        const std::string name = trim(f[3]);
-        if (name.rfind("Sensor #", 0) == 0) r.sensor = strtol(name.c_str() + 8, nullptr, 10);
-        r.type = canonical(f[4]);
-        r.event = canonical(f[5]);
+        r.id = strtol(trim(f[0]).c_str(), nullptr, l.idBase);
+        const std::string clock = l.clock < 0 ? "" : trim(f[l.clock]);
+        r.time = timeText(trim(f[l.date]) + (l.clock < 0 ? "" : " " + clock.substr(0, clock.find(' '))), l.timeFormat);
+        const size_t mark = l.sensor < 0 ? std::string::npos : f[l.sensor].find(l.sensorMark);
+        if (mark != std::string::npos)
+            r.sensor = strtol(f[l.sensor].c_str() + mark + l.numberAfterMark, nullptr, l.sensorBase);
+        r.type = l.canonicalType ? canonical(f[l.type]) : trim(f[l.type]);
+        r.event = canonical(f[l.event]);
         rows.push_back(r);
     }
     return rows;
@@ -124,7 +106,7 @@ TEST_P(SelPeerCrossCheck, AllToolsListTheSameRecords) {
     ASSERT_EQ(mine.exitCode, 0) << mine.err;
     ASSERT_EQ(elist.exitCode, 0) << elist.err;
     ASSERT_EQ(fi.exitCode, 0) << fi.err;
-    auto ours = ourRows(mine.out), tool = ipmitoolRows(elist.out), free = freeIpmiRows(fi.out);
+    auto ours = rowsOf(mine.out, kOurs), tool = rowsOf(elist.out, kIpmitool), free = rowsOf(fi.out, kFreeIpmi);
     ASSERT_FALSE(ours.empty()) << mine.out;
     ASSERT_EQ(ours.size(), tool.size()) << elist.out;
     ASSERT_EQ(ours.size(), free.size()) << fi.out;
@@ -151,11 +133,6 @@ std::vector<std::string> selProfiles() {
     return all;
 }
 
-INSTANTIATE_TEST_SUITE_P(Sel, SelPeerCrossCheck, ::testing::ValuesIn(selProfiles()),
-                         [](const ::testing::TestParamInfo<std::string>& p) {
-                             std::string name = p.param.substr(p.param.rfind('/') + 1);
-                             std::replace_if(name.begin(), name.end(), [](char c) { return !isalnum(c); }, '_');
-                             return name;
-                         });
+INSTANTIATE_TEST_SUITE_P(Sel, SelPeerCrossCheck, ::testing::ValuesIn(selProfiles()), profileTestName);
 
 }  // namespace

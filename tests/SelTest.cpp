@@ -23,13 +23,7 @@ using TestSupport::waitUntil;
 
 using Bytes = std::vector<uint8_t>;
 
-// A system event record; event data 2 and 3 default to "unspecified".
-sel_event_record eventRecord(uint8_t sensorType, uint8_t dirType, uint8_t data1, uint8_t data2 = 0xFF,
-                             uint8_t data3 = 0xFF, uint8_t recordType = 0x02, uint8_t evmRev = 4) {
-    sel_event_record r = {{0x02, 0x01}, recordType, {0, 0, 0, 0x5F}, {0x20, 0x00}, evmRev, sensorType, 0x30,
-                          dirType,      {data1, data2, data3}};
-    return r;
-}
+using TestSupport::eventRecord;
 
 Bytes bytesOf(const sel_event_record& r) {
     const auto* p = reinterpret_cast<const uint8_t*>(&r);
@@ -99,12 +93,6 @@ TEST(SelRecord, SummaryOfTheLog) {
 
 class SelFollow : public TestSupport::SimTest {
 protected:
-    void TearDown() override {
-        IpmiIfcSdrCleanUpHeaders(0);  // a record's sensor number may have loaded the SDRs
-        IpmiIfcSdrCleanUpAll(0);
-        IpmiIfcEntityCleanUpAll(0);
-        SimTest::TearDown();
-    }
     // Logs an event as a sensor would, stamped by the controller's clock;
     // `serial` makes it unique. Returns its bytes as stored, or empty when full.
     Bytes logEvent(uint16_t serial) {

@@ -34,14 +34,6 @@ SdrBuilder record(uint8_t recordType, uint8_t number, uint8_t eventReadingType =
 
 class SensorDiscovery : public TestSupport::SimTest {
 protected:
-    void TearDown() override {
-        IpmiIfcSdrCleanUpAll(0);
-        IpmiIfcSdrCleanUpHeaders(0);
-        IpmiIfcEntityCleanUpAll(0);      // the tree the refresh chain built
-        IpmiIfcSensorInstantiateAll(0);  // no records left: empties the list
-        SimTest::TearDown();
-    }
-
     // Files the record and gives the controller the sensor behind it.
     Sim::SensorModel& add(const Bytes& r) {
         bmc().sdr.records.push_back(r);

@@ -3,8 +3,8 @@
 
 #include <gtest/gtest.h>
 
-#include "Bmc.h"
 #include "IpmiCommands.h"
+#include "TestSupport.h"
 
 namespace {
 
@@ -28,14 +28,7 @@ protected:
         bmc.sensors[2].number = kRemote;
     }
     Response ask(uint8_t cmd, std::vector<uint8_t> data, uint8_t address = 0, uint8_t channel = 0) {
-        Sim::Request r;
-        r.netfn = netfn::sensorEvent;
-        r.cmd = cmd;
-        r.data = std::move(data);
-        r.viaIpmb = address != 0;
-        r.address = address;
-        r.channel = channel;
-        return bmc.handle(r);
+        return TestSupport::ask(bmc, netfn::sensorEvent, cmd, std::move(data), address, channel);
     }
     Sim::SensorModel& threshold() { return bmc.sensors[0]; }
     Sim::SensorModel& discrete() { return bmc.sensors[1]; }

@@ -7,7 +7,6 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <fstream>
 #include <sstream>
 
 #include "TestSupport.h"
@@ -111,16 +110,12 @@ ToolRun runTool(const std::string& profile, const std::string& tool, const std::
 }
 
 ToolRun runIpmiSensors(const std::string& profile, const std::vector<std::string>& extraArgs) {
-    return runFreeIpmi(profile, "ipmi-sensors", extraArgs);
-}
-
-ToolRun runFreeIpmi(const std::string& profile, const std::string& program, const std::vector<std::string>& extraArgs) {
     char cache[] = "/tmp/tav-sdr-cache-XXXXXX";
     if (mkdtemp(cache) == nullptr) return ToolRun();
     std::vector<std::string> args{"--driver-type=OPENIPMI", std::string("--sdr-cache-directory=") + cache,
                                   "--quiet-cache"};
     args.insert(args.end(), extraArgs.begin(), extraArgs.end());
-    ToolRun run = runTool(profile, toolPath(program), args);
+    ToolRun run = runTool(profile, toolPath("ipmi-sensors"), args);
     nftw(
         cache, [](const char* p, const struct stat*, int, struct FTW*) { return remove(p); }, 16,
         FTW_DEPTH | FTW_PHYS);
@@ -136,51 +131,6 @@ std::vector<std::string> referenceSets() {
 std::string referenceProfile(const std::string& set) {
     const std::string emu = realDataPath("sim/" + set.substr(set.rfind('/') + 1) + ".emu");
     return emu.empty() ? set + ".sdr" : emu;
-}
-
-std::string readFile(const std::string& path) {
-    std::ifstream in(path);
-    std::stringstream s;
-    s << in.rdbuf();
-    return s.str();
-}
-
-std::string trim(const std::string& s) {
-    size_t b = s.find_first_not_of(" \t\r\n");
-    if (b == std::string::npos) return std::string();
-    return s.substr(b, s.find_last_not_of(" \t\r\n") - b + 1);
-}
-
-std::vector<std::string> lines(const std::string& text) {
-    std::vector<std::string> out;
-    std::stringstream in(text);
-    std::string line;
-    while (std::getline(in, line)) out.push_back(line);
-    return out;
-}
-
-std::vector<std::string> split(const std::string& s, char sep, size_t maxFields) {
-    std::vector<std::string> out;
-    size_t start = 0;
-    while (out.size() + 1 < maxFields) {
-        size_t at = s.find(sep, start);
-        if (at == std::string::npos) break;
-        out.push_back(s.substr(start, at - start));
-        start = at + 1;
-    }
-    out.push_back(s.substr(start));
-    return out;
-}
-
-std::map<std::string, std::string> fields(const std::string& text) {
-    std::map<std::string, std::string> out;
-    for (const auto& line : lines(text)) {
-        size_t colon = line.find(" : ");
-        if (colon == std::string::npos) continue;
-        std::string name = trim(line.substr(0, colon));
-        if (!name.empty() && !out.count(name)) out[name] = trim(line.substr(colon + 3));
-    }
-    return out;
 }
 
 }  // namespace TestSupport

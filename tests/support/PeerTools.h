@@ -5,9 +5,10 @@
 // controller through the preload library, and the text helpers that read
 // what they print.
 
-#include <map>
 #include <string>
 #include <vector>
+
+#include "Text.h"
 
 namespace TestSupport {
 
@@ -25,8 +26,6 @@ std::string toolPath(const std::string& name);
 // virtual, so requests the controller leaves unanswered cost nothing.
 ToolRun runTool(const std::string& profile, const std::string& tool, const std::vector<std::string>& args);
 
-// A FreeIPMI program (e.g. "ipmi-sel") on the simulator with a fresh SDR cache of its own.
-ToolRun runFreeIpmi(const std::string& profile, const std::string& program, const std::vector<std::string>& extraArgs);
 // `ipmi-sensors` on the simulator with a fresh SDR cache of its own.
 ToolRun runIpmiSensors(const std::string& profile, const std::vector<std::string>& extraArgs = {});
 
@@ -36,14 +35,6 @@ ToolRun runIpmiSensors(const std::string& profile, const std::vector<std::string
 // running it), else the bare SDR dump.
 std::vector<std::string> referenceSets();
 std::string referenceProfile(const std::string& set);
-
-std::string readFile(const std::string& path);
-std::string trim(const std::string& s);
-std::vector<std::string> lines(const std::string& text);
-// Splits at `sep`; the last field takes the rest once `maxFields` are reached.
-std::vector<std::string> split(const std::string& s, char sep, size_t maxFields = static_cast<size_t>(-1));
-// "Name : value" lines, names and values trimmed; the first of each name.
-std::map<std::string, std::string> fields(const std::string& text);
 
 }  // namespace TestSupport
 

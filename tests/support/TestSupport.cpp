@@ -1,5 +1,6 @@
 #include "TestSupport.h"
 
+#include <ctype.h>
 #include <dirent.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -74,7 +75,13 @@ void SimTest::SetUp() {
     }
 }
 
+// Leaves no cached record behind, whatever the test built: a leak check sees only the test's own.
 void SimTest::TearDown() {
+    Ipmi::IpmiIfcSdrCleanUpAll(0);
+    Ipmi::IpmiIfcSdrCleanUpHeaders(0);
+    Ipmi::IpmiIfcEntityCleanUpAll(0);
+    Ipmi::IpmiIfcSensorInstantiateAll(0);  // no records left: empties the list
+    node().frus.clear();
     Ipmi::IpmiIfcOpenIpmiClose(0);
     sim().clearFaults();
     sim().uninstall();
@@ -148,6 +155,26 @@ std::vector<uint8_t> SdrBuilder::bytes() const {
     return out;
 }
 
+Sim::Response ask(Sim::Bmc& bmc, uint8_t netfn, uint8_t command, std::vector<uint8_t> data, uint8_t ipmbAddress,
+                  uint8_t ipmbChannel) {
+    Sim::Request r;
+    r.netfn = netfn;
+    r.cmd = command;
+    r.data = std::move(data);
+    if (ipmbAddress != 0) {
+        r.viaIpmb = true;
+        r.address = ipmbAddress;
+        r.channel = ipmbChannel;
+    }
+    return bmc.handle(r);
+}
+
+Ipmi::sel_event_record eventRecord(uint8_t sensorType, uint8_t dirType, uint8_t data1, uint8_t data2, uint8_t data3,
+                             uint8_t recordType, uint8_t evmRev) {
+    return {{0x02, 0x01}, recordType, {0, 0, 0, 0x5F}, {0x20, 0x00}, evmRev, sensorType, 0x30, dirType,
+            {data1, data2, data3}};
+}
+
 LoopThread::LoopThread(int interval)
     : thread_([interval] {
           try {
@@ -189,6 +216,13 @@ std::vector<std::string> realDataFiles(const std::string& dir, const std::string
     if (d != nullptr) closedir(d);
     std::sort(files.begin(), files.end());
     return files;
+}
+
+std::string profileTestName(const ::testing::TestParamInfo<std::string>& info) {
+    std::string name = info.param.substr(info.param.rfind('/') + 1);
+    for (char& c : name)
+        if (!isalnum(static_cast<unsigned char>(c))) c = '_';
+    return name;
 }
 
 }  // namespace TestSupport

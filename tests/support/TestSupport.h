@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "Bmc.h"
+#include "IpmiSelData.h"
 #include "IpmiIfcInternal.h"
 #include "Sim.h"
 
@@ -85,6 +86,16 @@ private:
     size_t idAt_;
 };
 
+// The simulated controller's own answer, without the transport; over IPMB
+// when an address is given.
+Sim::Response ask(Sim::Bmc& bmc, uint8_t netfn, uint8_t command, std::vector<uint8_t> data = {},
+                  uint8_t ipmbAddress = 0, uint8_t ipmbChannel = 0);
+
+// A system event record 0x0102 from the BMC (0x20), sensor 0x30, stamped
+// 0x5F000000; event data 2 and 3 default to "unspecified".
+Ipmi::sel_event_record eventRecord(uint8_t sensorType, uint8_t dirType, uint8_t data1, uint8_t data2 = 0xFF,
+                             uint8_t data3 = 0xFF, uint8_t recordType = 0x02, uint8_t evmRev = 4);
+
 // IpmiIfc::start(0, interval) on a thread of its own, as a host process runs
 // it. Destruction stops the interface (unless stop() was called) and joins.
 class LoopThread {
@@ -106,6 +117,10 @@ void waitUntil(const std::function<bool()>& done);
 std::string realDataPath(const std::string& relative);
 // Paths of the files in that directory whose names end in `suffix`, sorted; none when absent.
 std::vector<std::string> realDataFiles(const std::string& dir, const std::string& suffix);
+
+// A parameterised test's name for a profile path: its file name, other
+// characters than letters and digits as '_'.
+std::string profileTestName(const ::testing::TestParamInfo<std::string>& info);
 
 #define SKIP_WITHOUT_REAL_DATA(path)                                       \
     do {                                                                   \

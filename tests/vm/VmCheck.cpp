@@ -15,7 +15,6 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <fstream>
 #include <map>
 #include <set>
 #include <sstream>
@@ -59,19 +58,6 @@ Run run(const std::string& command) {
     return result;
 }
 
-std::string trim(const std::string& s) {
-    size_t b = s.find_first_not_of(" \t\r\n");
-    return b == std::string::npos ? std::string() : s.substr(b, s.find_last_not_of(" \t\r\n") - b + 1);
-}
-
-std::vector<std::string> lines(const std::string& text) {
-    std::vector<std::string> out;
-    std::stringstream in(text);
-    std::string line;
-    while (std::getline(in, line)) out.push_back(line);
-    return out;
-}
-
 std::vector<std::string> cells(const std::string& row) {
     std::vector<std::string> out;
     std::stringstream in(row);
@@ -96,14 +82,7 @@ namespace {
 const char* kIpmitool = "ipmitool -I open ";
 const uint8_t kNetfnApp = 0x06, kGetDeviceId = 0x01, kNetfnStorage = 0x0A, kGetSelInfo = 0x40;
 
-std::string syslogText() {
-    std::ifstream in("/tmp/messages");
-    std::stringstream s;
-    s << in.rdbuf();
-    return s.str();
-}
-
-bool logged(const std::string& text) { return syslogText().find(text) != std::string::npos; }
+bool logged(const std::string& text) { return TestSupport::readFile("/tmp/messages").find(text) != std::string::npos; }
 
 uint8_t getDeviceId() {
     uint8_t answer[32];
@@ -300,19 +279,10 @@ void checkReadingChange(Checks& checks) {
     checks.skip("reading change", "no threshold sensor with a reading");
 }
 
-std::string lower(std::string s) {
-    for (char& c : s) c = static_cast<char>(tolower(static_cast<unsigned char>(c)));
-    return s;
-}
-
 void checkLan(Checks& checks) {
     Ipmi::IpmiLan* lan = IpmiIfc::getLan(0);
     const int channel = lan->getChannel();
-    std::map<std::string, std::string> field;
-    for (const std::string& line : lines(run(std::string(kIpmitool) + "lan print " + std::to_string(channel)).out)) {
-        size_t colon = line.find(" : ");
-        if (colon != std::string::npos) field.emplace(trim(line.substr(0, colon)), trim(line.substr(colon + 3)));
-    }
+    auto field = TestSupport::fields(run(std::string(kIpmitool) + "lan print " + std::to_string(channel)).out);
     static const char* const kOrigins[] = {"unspecified", "static address", "dhcp address", "bios assigned address",
                                            "other"};
     const int origin = lan->getAddressOrigin();
@@ -320,8 +290,8 @@ void checkLan(Checks& checks) {
         {lan->getIPv4Address(), field["IP Address"]},
         {lan->getIPv4Netmask(), field["Subnet Mask"]},
         {lan->getIPv4DefaultGateway(), field["Default Gateway IP"]},
-        {lower(lan->getMACAddress()), lower(field["MAC Address"])},
-        {origin >= 0 && origin <= 4 ? kOrigins[origin] : "?", lower(field["IP Address Source"])}};
+        {TestSupport::lower(lan->getMACAddress()), TestSupport::lower(field["MAC Address"])},
+        {origin >= 0 && origin <= 4 ? kOrigins[origin] : "?", TestSupport::lower(field["IP Address Source"])}};
     for (const auto& p : pairs)
         checks.expect(p.first == p.second, "LAN channel " + std::to_string(channel),
                       "'" + p.first + "', ipmitool '" + p.second + "'");

@@ -10,7 +10,12 @@
 #include <string>
 #include <vector>
 
+#include "Text.h"
+
 namespace VmCheck {
+
+using TestSupport::lines;
+using TestSupport::trim;
 
 class Checks {
 public:
@@ -32,8 +37,6 @@ struct Run {
 
 // Runs a shell command in the guest, stdout and stderr together.
 Run run(const std::string& command);
-std::string trim(const std::string& s);
-std::vector<std::string> lines(const std::string& text);
 // The cells of an ipmitool table row, trimmed.
 std::vector<std::string> cells(const std::string& row);
 
@@ -44,7 +47,7 @@ bool proxy(std::vector<uint8_t> request);
 // One full pass of the polling loop, waited for.
 void fullPass();
 
-// SEL and FRU inventory: present once the library has them.
+// SEL delivery and FRU inventory (VmInventory.cpp).
 void prepareSel();
 void checkSel(Checks& checks);
 void checkFru(Checks& checks);

@@ -1,6 +1,4 @@
-// SEL delivery and FRU inventory checks of the guest checker. Each half is
-// built only when the library's headers offer it, and reports itself skipped
-// otherwise.
+// SEL delivery and FRU inventory checks of the guest checker.
 
 #include <stdio.h>
 #include <stdlib.h>
@@ -9,17 +7,10 @@
 #include <set>
 #include <string>
 
-#include "IpmiIfc.h"
-#include "VmCheck.h"
-
-#if __has_include("IpmiSel.h")
-#include "IpmiSel.h"
-#define TAV_VM_HAS_SEL 1
-#endif
-#if __has_include("IpmiFru.h")
 #include "IpmiFru.h"
-#define TAV_VM_HAS_FRU 1
-#endif
+#include "IpmiIfc.h"
+#include "IpmiSel.h"
+#include "VmCheck.h"
 
 namespace VmCheck {
 
@@ -41,11 +32,6 @@ void addSelRecords(Checks& checks) {
     checks.expect(added && before == 3 && after == 5, "two SEL records added through the ipmi_sim console",
                   "ipmitool counts " + std::to_string(before) + ", then " + std::to_string(after));
 }
-
-}  // namespace
-
-#ifdef TAV_VM_HAS_SEL
-namespace {
 
 std::mutex deliveredMutex;
 std::multiset<unsigned> delivered;  // record IDs handed to the handler
@@ -83,15 +69,6 @@ void checkSel(Checks& checks) {
     checks.expect(deliveredCount() == 2 && distinct.size() == 2, "each added SEL record is delivered exactly once",
                   std::to_string(deliveredCount()) + " deliveries, " + std::to_string(distinct.size()) + " records");
 }
-#else
-void prepareSel() {}
-void checkSel(Checks& checks) {
-    addSelRecords(checks);
-    checks.skip("SEL delivery", "the library has no SEL reader yet");
-}
-#endif
-
-#ifdef TAV_VM_HAS_FRU
 // Every FRU device ipmitool prints is in the library's inventory, with the
 // same board serial number where the board area has one.
 void checkFru(Checks& checks) {
@@ -127,8 +104,5 @@ void checkFru(Checks& checks) {
     checks.expect(!ours.empty() && mismatch.empty(), "FRU inventory matches ipmitool",
                   std::to_string(ours.size()) + " devices" + mismatch);
 }
-#else
-void checkFru(Checks& checks) { checks.skip("FRU inventory", "the library has no FRU inventory yet"); }
-#endif
 
 }  // namespace VmCheck
