@@ -15,6 +15,7 @@
 
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "BenchSupport.h"
 #include "Bmc.h"
@@ -87,6 +88,36 @@ void BM_RefreshChain(benchmark::State& state) {
     finishRun();
 }
 BENCHMARK(BM_RefreshChain)->Arg(0)->Arg(1000)->Iterations(4)->Unit(benchmark::kMillisecond);
+
+// The floor against itself: the chain's requests replayed twice by the bare
+// client at the latency, in turns first. How far this ratio strays from 1 is
+// how finely the machine resolves any wall ratio above.
+void BM_BareAgainstItself(benchmark::State& state) {
+    if (!prepare(state, server(state))) return;
+    forgetEverything();
+    sim().resetCounters();
+    IpmiIfcSdrGetInfo(0);
+    const std::vector<Sim::Request> requests = sim().requests();
+    sim().resetCounters();
+    double first = 0, second = 0;
+    bool turn = false;
+    for (auto _ : state) {
+        state.PauseTiming();
+        sim().setLatencyUs(Bench::kLatencyUs);
+        const double a = Bench::replayBare(requests).wall;
+        const double b = Bench::replayBare(requests).wall;
+        sim().setLatencyUs(0);
+        sim().resetCounters();
+        first += turn ? b : a;  // "first" is always the same one of the two
+        second += turn ? a : b;
+        turn = !turn;
+        state.ResumeTiming();
+    }
+    state.counters["exchanges"] = static_cast<double>(requests.size());
+    state.counters["wall_ratio"] = first / second;
+    finishRun();
+}
+BENCHMARK(BM_BareAgainstItself)->Arg(0)->Iterations(8)->Unit(benchmark::kMillisecond);
 
 void BM_ReadingRefresh(benchmark::State& state) {
     if (!prepare(state, server(state))) return;

@@ -99,7 +99,7 @@ void BM_SelLoadAtStart(benchmark::State& state) {
     state.counters["heap_bytes_per_record_beyond_16"] = heapPerRecord(kRecords);
     closeNode();
 }
-BENCHMARK(BM_SelLoadAtStart)->Unit(benchmark::kMillisecond)->Iterations(2);
+BENCHMARK(BM_SelLoadAtStart)->Unit(benchmark::kMillisecond)->Iterations(4);
 
 void countRecord(void* context, IpmiSelData* record) {
     if (record != nullptr) ++*static_cast<size_t*>(context);

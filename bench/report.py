@@ -53,6 +53,8 @@ def floor_table(runs):
         ("periodic poll pass, default profile", "BM_PollPass/0/8"),
         ("SEL record delivered, log of 100", "BM_SelRecordDelivered/100"),
         ("SEL record delivered, log of 3,000", "BM_SelRecordDelivered/3000"),
+        ("control: the bare client against itself (the chain's requests, default profile)",
+         "BM_BareAgainstItself/0"),
     ]
     out = [
         "| operation | exchanges | library wall (ms) | bare client wall (ms) | ratio (goal ≤ 1.01) "
@@ -64,6 +66,9 @@ def floor_table(runs):
         r = runs.get(key)
         if r is None or "wall_ratio" not in r:
             out.append(f"| {label} | n/a | | | | | | |")
+            continue
+        if "lib_wall_ms" not in r:  # the bare client against itself
+            out.append(f"| {label} | {num(r['exchanges'], 0)} | | | {r['wall_ratio']:.3f} | | | |")
             continue
         ratio = r["wall_ratio"]
         cpu = r["lib_cpu_us_per_exchange"]
