@@ -18,9 +18,13 @@ def load(path):
         data = json.load(f)
     runs = {}
     for b in data["benchmarks"]:
-        # BM_Name/args/iterations:N -> BM_Name/args
-        name = re.sub(r"/(iterations|real_time|min_time)[^/]*", "", b["name"])
-        runs[name] = b
+        # Repeated runs: the median of each figure, whatever one run met.
+        if b.get("run_type") == "aggregate" and b.get("aggregate_name") != "median":
+            continue
+        # BM_Name/args/iterations:N[_median] -> BM_Name/args
+        name = re.sub(r"/(iterations|real_time|min_time)[^/]*", "", b.get("run_name", b["name"]))
+        if b.get("run_type") == "aggregate" or name not in runs:
+            runs[name] = b
     return data["context"], runs
 
 
