@@ -56,9 +56,7 @@ void openNode(const std::shared_ptr<Sim::Bmc>& bmc) {
 
 void forgetSel() {
     InitIpmiNode(0);
-    std::vector<std::shared_ptr<IpmiSelData>> gone;
-    TAV::MutexLock guard(g_IpmiNode[0].selMutex);
-    gone.swap(g_IpmiNode[0].selRecords);
+    IpmiIfcSelDropRecords(0);
 }
 
 void closeNode() {

@@ -178,6 +178,9 @@ uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count);
 int IpmiIfcRhSelInfoNoCount(ipmiifc_resp* resp);
 int IpmiIfcRhSelGetAllocInfo(ipmiifc_resp* resp);
 void IpmiIfcSelCleanUpEventHandlers(int node);
+// Drops every SEL record held (the next Get SEL Info answer reads the log again
+// only if its stamps changed).
+void IpmiIfcSelDropRecords(int node);
 
 // FRU inventory.
 extern int fru_max_req_size;

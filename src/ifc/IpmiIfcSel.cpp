@@ -137,11 +137,29 @@ private:
     TAV::Mutex& m_;
 };
 
+// Beside each node's record list, under its selMutex: the latest event time
+// stamp among the records up to each position. Delivery starts where that
+// first passes `since`: every record before holds nothing newer, so a log of
+// thousands is not looked through for the one record that came.
+std::vector<uint32_t> g_latestStampUpTo[IPMI_NODE_COUNT];
+
+std::vector<uint32_t>& latestStampUpTo(const IpmiNode& n) { return g_latestStampUpTo[&n - g_IpmiNode]; }
+
+// Empties the node's record list into `out` (released outside the lock).
+void takeRecords(IpmiNode& n, std::vector<std::shared_ptr<IpmiSelData>>& out) {
+    TAV::MutexLock guard(n.selMutex);
+    out.swap(n.selRecords);
+    latestStampUpTo(n).clear();
+}
+
 // Puts one record read into the list; selMutex not held.
 void appendRecord(int node, ipmiifc_sel_entry& entry) {
     IpmiNode& n = slot(node);
     auto record = std::make_shared<IpmiSelData>(&entry.record, 0);
+    const uint32_t stamp = record->isSelEventRecord() ? record->messageTimeStamp() : 0;
     TAV::MutexLock guard(n.selMutex);
+    std::vector<uint32_t>& latest = latestStampUpTo(n);
+    latest.push_back(latest.empty() || latest.back() < stamp ? stamp : latest.back());
     n.selRecords.push_back(std::move(record));
     n.work.sel.last_record_id = sel::le16(entry.record.record_id);
 }
@@ -426,10 +444,7 @@ uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
     std::vector<std::shared_ptr<IpmiSelData>> previous;  // released outside the lock
     if (!cli && oldErase == newErase) {
         // Records held from before a restart would be read again behind themselves.
-        if (nothingStored) {
-            TAV::MutexLock guard(n.selMutex);
-            previous.swap(n.selRecords);
-        }
+        if (nothingStored) takeRecords(n, previous);
         previous.clear();
         IpmiIfcSelReserve(node);
         readNew(node, last, static_cast<uint32_t>(newCount) + 1);
@@ -447,14 +462,16 @@ uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
         n.work.sel.last_record_id = 0;
     }
     IpmiIfcSelReserve(node);
-    {
-        TAV::MutexLock guard(n.selMutex);
-        previous.swap(n.selRecords);
-    }
+    takeRecords(n, previous);
     previous.clear();
     IpmiIfcSelGetAll(node);
     IpmiIfcSelGenerateEvents(node, since);
     return 0;
+}
+
+void IpmiIfcSelDropRecords(int node) {
+    std::vector<std::shared_ptr<IpmiSelData>> gone;  // released outside the lock
+    takeRecords(slot(node), gone);
 }
 
 int IpmiIfcRhSelInfoNoCount(ipmiifc_resp* resp) { return static_cast<int>(IpmiIfcRhSelInfo(resp, nullptr)); }
@@ -471,9 +488,11 @@ uint32_t IpmiIfcSelGenerateEvents(int node, uint32_t sinceTimestamp) {
     for (size_t i = 0;; ++i) {
         std::shared_ptr<IpmiSelData> record;
         {
-            // Records not due are passed over under one lock: a log of
-            // thousands mostly holds records delivered long ago.
+            // Records not due are passed over under one lock.
             TAV::MutexLock guard(n.selMutex);
+            const std::vector<uint32_t>& latest = latestStampUpTo(n);
+            if (i == 0 && sinceTimestamp != 0xFFFFFFFF && latest.size() == n.selRecords.size())
+                i = static_cast<size_t>(std::upper_bound(latest.begin(), latest.end(), sinceTimestamp) - latest.begin());
             while (i < n.selRecords.size() && !due(*n.selRecords[i])) ++i;
             if (i >= n.selRecords.size()) return 0;
             record = n.selRecords[i];
