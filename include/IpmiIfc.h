@@ -11,6 +11,7 @@
 #include "IpmiEntity.h"
 #include "IpmiFru.h"
 #include "IpmiNode.h"
+#include "IpmiSelData.h"
 #include "TavIpmiExport.h"
 
 namespace Ipmi {
@@ -178,6 +179,13 @@ public:
     static int unRegisterSelEventHandler(int node, IpmiSelEventHandler handler);
     static int unRegisterSelEventHandler(IpmiSelEventHandler handler);
     static bool generatesMemoryEvents(int node);
+    // Hands over, once, the records a caller missed while it was not running.
+    // Call before `start`: the first pass then delivers the records that
+    // follow `after` in the log (found by ID and digest; when that record is
+    // gone, cleared or overwritten, those stamped later than it) instead of
+    // none, and records wait for the first registered handler. A cursor with
+    // digest 0 changes nothing.
+    static void resumeSelDelivery(int node, const IpmiSelCursor& after);
 
     // System event log. Results of clearSel.
     enum SEL_CLEAR_RESULT {

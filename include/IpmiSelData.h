@@ -32,6 +32,21 @@ enum {
     SEL_EVENT_TYPE_MASK = 0x7F
 };
 
+class IpmiSelData;
+
+// Where a caller's delivery stands: the last record it received, told by its
+// ID, its time stamp and a digest of its 16 bytes. Kept across restarts by a
+// caller (IpmiIfc::resumeSelDelivery), so its fields are plain numbers.
+struct IpmiSelCursor {
+    uint16_t recordId = 0;
+    uint32_t timestamp = 0;  // messageTimeStamp() of the record
+    uint64_t digest = 0;     // IpmiSelCursor::digestOf its 16 bytes; 0: no cursor
+    // FNV-1a over the record's bytes, never 0.
+    TAV_IPMI_API static uint64_t digestOf(const sel_event_record& record);
+    // The cursor that stands on `record`.
+    TAV_IPMI_API static IpmiSelCursor at(const IpmiSelData& record);
+};
+
 // One SEL record as the library hands it to callers: the 16 bytes read from
 // the controller and the node they came from. Immutable once built, so any
 // thread may read it while the polling loop goes on.
