@@ -76,6 +76,8 @@ struct SelModel {
     uint16_t lastProcessedByBmc = 0xFFFF;
     // Log a "log area reset/cleared" event after an erase, as many controllers do.
     bool logsClearEvent = false;
+    // A full log overwrites its oldest record, the erase stamp unchanged.
+    bool circular = false;
 };
 
 struct LanChannelModel {

@@ -218,7 +218,8 @@ uint16_t addSelRecord(Bmc& bmc, const uint8_t record[16], bool keepTimestamp) {
     SelModel& sel = bmc.sel;
     if (sel.records.size() >= capacity(sel)) {
         sel.overflow = true;
-        return 0;
+        if (!sel.circular || sel.records.empty()) return 0;
+        sel.records.erase(sel.records.begin());
     }
     std::vector<uint8_t> r(record, record + kRecordBytes);
     uint16_t id = sel.nextRecordId;
