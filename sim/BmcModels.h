@@ -78,6 +78,8 @@ struct SelModel {
     bool logsClearEvent = false;
     // A full log overwrites its oldest record, the erase stamp unchanged.
     bool circular = false;
+    // Nonzero: the SEL clock stands at this value (tests move it by hand).
+    uint32_t frozenClock = 0;
 };
 
 struct LanChannelModel {

@@ -211,6 +211,7 @@ Response getLastProcessedEventId(Bmc& b, const Request& r) {
 }  // namespace
 
 uint32_t selClock(const Bmc& bmc) {
+    if (bmc.sel.frozenClock != 0) return bmc.sel.frozenClock;
     return static_cast<uint32_t>(static_cast<int64_t>(time(nullptr)) + bmc.sel.clockOffset);
 }
 

@@ -66,6 +66,9 @@ struct Follow {
     size_t firstUnhandled = 0;         // no record before it waits
     uint32_t foundAtStart = 0;         // records of the log found at start still to be read
     std::set<RecordKey> carried;       // records handled before a reload, until a whole read
+    // Records read but not yet handed over when a reload (a clear from a
+    // handler, say) took them out of the list: they go first.
+    std::vector<std::shared_ptr<IpmiSelData>> pending;
     bool readOn = false;               // the last pass stopped short of the log's end
     IpmiSelCursor resumeAfter;         // set by resumeSelDelivery until the first pass
     bool cursorDue = false;            // resumeAfter waits for a whole read of the log
@@ -138,9 +141,12 @@ void takeRecords(int node, std::vector<std::shared_ptr<IpmiSelData>>& out, bool 
     Follow& f = followOf(node);
     TAV::MutexLock guard(n.selMutex);
     out.swap(n.selRecords);
-    if (carry)
-        for (size_t i = 0; i < out.size() && i < f.handled.size(); ++i)
-            if (f.handled[i]) f.carried.insert(keyOf(out[i]->record()));
+    if (carry) {
+        for (size_t i = 0; i < out.size() && i < f.handled.size(); ++i) {
+            if (!f.handled[i]) f.pending.push_back(out[i]);  // its copy read again counts as handled
+            f.carried.insert(keyOf(out[i]->record()));
+        }
+    }
     f.handled.clear();
     f.firstUnhandled = 0;
 }
@@ -153,6 +159,7 @@ void startFollowing(int node, uint16_t entries) {
     Follow& f = followOf(node);
     TAV::MutexLock guard(slot(node).selMutex);
     f.carried.clear();
+    f.pending.clear();
     f.readOn = false;
     f.cursorDue = f.resumeAfter.digest != 0;
     f.holdForHandler = f.cursorDue;
@@ -565,6 +572,27 @@ void appendRecord(int node, const ipmiifc_sel_entry& entry) {
     n.work.sel.last_record_id = sel::le16(entry.record.record_id);
 }
 
+// The next record to hand over, marked handled; null when none is due. Records
+// a reload took out of the list come first: they are older than any in it.
+std::shared_ptr<IpmiSelData> takeNextDue(IpmiNode& n, Follow& f, bool anyHandler) {
+    TAV::MutexLock guard(n.selMutex);
+    if (f.cursorDue || (f.holdForHandler && !anyHandler)) return nullptr;
+    std::shared_ptr<IpmiSelData> record;
+    if (!f.pending.empty()) {
+        record = std::move(f.pending.front());
+        f.pending.erase(f.pending.begin());
+    } else {
+        size_t i = f.firstUnhandled;
+        while (i < f.handled.size() && f.handled[i]) ++i;
+        f.firstUnhandled = i;
+        if (i >= n.selRecords.size() || i >= f.handled.size()) return nullptr;
+        f.handled[i] = 1;
+        record = n.selRecords[i];
+    }
+    f.holdForHandler = false;
+    return record;
+}
+
 // Hands every record not yet handled to the handlers, oldest first, marking
 // it before the call: a pass that a handler starts (clearSel) finds it
 // handled. The list is looked at again after every record, so records
@@ -575,21 +603,8 @@ void deliverDue(int node) {
     Follow& f = followOf(node);
     const bool anyHandler = IpmiIfcSelHasHandlers();
     Depth delivering(t_delivering);
-    for (;;) {
-        std::shared_ptr<IpmiSelData> record;
-        {
-            TAV::MutexLock guard(n.selMutex);
-            if (f.cursorDue || (f.holdForHandler && !anyHandler)) return;
-            size_t i = f.firstUnhandled;
-            while (i < f.handled.size() && f.handled[i]) ++i;
-            f.firstUnhandled = i;
-            if (i >= n.selRecords.size() || i >= f.handled.size()) return;
-            f.handled[i] = 1;
-            record = n.selRecords[i];
-            f.holdForHandler = false;
-        }
+    while (std::shared_ptr<IpmiSelData> record = takeNextDue(n, f, anyHandler))
         IpmiIfcSelDeliverToHandlers(record.get());
-    }
 }
 
 }  // namespace
