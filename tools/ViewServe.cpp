@@ -20,6 +20,7 @@
 #include "IpmiIfc.h"
 #include "IpmiSelData.h"
 #include "Metrics.h"
+#include "SelCursorFile.h"
 #include "SelFacts.h"
 #include "Views.h"
 
@@ -27,11 +28,13 @@ namespace {
 
 std::string listen = "127.0.0.1:9623";
 int interval = 1;
+Tool::SelCursorFile selState;
 
 void serveOptions(CLI::App& sub) {
     sub.add_option("--listen", listen, "HOST:PORT to answer on (default 127.0.0.1:9623; port 0: any free port)");
     sub.add_option("--interval", interval, "polling interval in units of 16 seconds (default 1)")
         ->check(CLI::PositiveNumber);
+    selState.addOption(sub, "serve.state");
 }
 
 bool splitListen(const std::string& text, std::string& host, int& port) {
@@ -62,7 +65,9 @@ void runLoop() {
 
 // Exactly once per record: the loop hands each new record over once.
 void countEvent(void*, Ipmi::IpmiSelData* record) {
-    if (record != nullptr) Tool::countSelEvent(*record);
+    if (record == nullptr) return;
+    Tool::countSelEvent(*record);
+    selState.save(*record);
 }
 
 int serve(std::vector<Tool::Section>&) {
@@ -101,6 +106,7 @@ int serve(std::vector<Tool::Section>&) {
     }
 
     Tool::loadHealthRules();
+    selState.resume();
     std::thread loop(runLoop);
     const int state =
         Ipmi::IpmiIfc::waitState(0, Ipmi::IpmiIfc::IPMI_STATE_RUNNING | Ipmi::IpmiIfc::IPMI_STATE_STOPPED);
