@@ -443,9 +443,11 @@ TEST_F(SelOverTime, EveryRecordLoggedAfterStartReachesTheHandlersOnce) {
          }},
         {"a full log that overwrites its oldest records, the last read among them",
          [](SelOverTime& t) {
+             // Four records fit: four events a pass overwrite the last one read.
+             t.bmc().sel.allocationUnits = 4;
              t.bmc().sel.circular = true;
-             for (int p = 0; p < 5; ++p) {
-                 for (int i = 0; i < 2 - (p == 4); ++i) t.tick(), t.event();
+             for (int p = 0; p < 3; ++p) {
+                 for (int i = 0; i < 4; ++i) t.tick(), t.event();
                  t.pass();
              }
          }},
