@@ -7,6 +7,12 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/install-deps.sh
 
+# libFuzzer's findings belong in build-fuzz/artifacts/, never in the tree.
+if git ls-files 2>/dev/null | grep -E '(^|/)(crash|leak|oom|slow-unit|timeout)-[0-9a-f]{40}$'; then
+  echo "libFuzzer artifacts are tracked in the tree (above): remove them"
+  exit 1
+fi
+
 jobs=$(nproc)
 build() {
   local dir=$1
