@@ -285,9 +285,22 @@ TEST_F(SelFollow, UnregisterWaitsForTheRunningCall) {
     EXPECT_TRUE(sawFinished.load());
 }
 
-// Controllers that answer badly: every read ends within its bounds (four
-// attempts a chunk, one request per record the log claims, plus one) and no
-// record is held twice.
+// Every ID names a record, and every record has a next one.
+Sim::Response endlessChain(Sim::Bmc&, const Sim::Request& r) {
+    const uint16_t id = sel::le16(r.data.data() + sel::entryRequest::recordId);
+    const uint16_t own = id == 0 ? 1 : id;
+    Sim::Response out{cc::ok, uint8_t(own + 1), uint8_t((own + 1) >> 8)};
+    sel_event_record e = eventRecord(0x01, 0x01, 0x07);
+    sel::putLe16(e.record_id, own);
+    const Bytes bytes = bytesOf(e);
+    out.insert(out.end(), bytes.begin(), bytes.end());
+    return out;
+}
+
+// Controllers that answer badly: every pass ends within its bounds (four
+// attempts a chunk and a retry budget for the whole pass, one request per
+// record the log claims plus one, at most 4,096 records) and no record is
+// held twice; the reload never asks Get SEL Info again from within itself.
 TEST_F(SelFollow, HostileAnswersEndWithinBounds) {
     for (uint16_t i = 1; i <= 5; ++i) logEvent(i);
     auto fault = [this](const Sim::Fault& f) { sim().addFault(netfn::storage, cmd::getSelEntry, f); };
@@ -302,7 +315,25 @@ TEST_F(SelFollow, HostileAnswersEndWithinBounds) {
         {"answers cut short", [&] { fault(Sim::Fault::answerLength(Sim::FaultKind::CutAnswer, 12, -1)); }, 0, 4 * 6},
         {"answers too long", [&] { fault(Sim::Fault::answerLength(Sim::FaultKind::LongAnswer, 30, -1)); }, 0, 4 * 6},
         {"reservation always cancelled", [&] { fault(Sim::Fault::completionCode(cc::reservationCancelled, -1)); }, 0,
-         4 * 6},
+         24},
+        {"busy for ever", [&] { fault(Sim::Fault::completionCode(cc::nodeBusy, -1)); }, 0, 24},
+        {"next IDs that never end, 0xFFFF entries claimed",
+         [this] {
+             bmc().on(netfn::storage, cmd::getSelEntry, endlessChain);
+             bend(false, true);
+         },
+         4096, 4097},
+        {"version 0, erased at every answer",
+         [this] {
+             auto standard = std::make_shared<Sim::Bmc>();
+             bmc().sel.version = 0;
+             bmc().on(netfn::storage, cmd::getSelInfo, [standard](Sim::Bmc& b, const Sim::Request& r) {
+                 b.sel.eraseTimestamp += 1;
+                 standard->sel = b.sel;
+                 return standard->handle(r);
+             });
+         },
+         0, 0},
     };
     for (uint32_t erase : {0u, 1000u}) {  // the first read: incremental from record 0, or a reload
         for (const auto& s : scenes) {
@@ -310,7 +341,10 @@ TEST_F(SelFollow, HostileAnswersEndWithinBounds) {
             InitIpmiNode(0);
             sim().clearFaults();
             Sim::registerSelHandlers(bmc());
-            sim().withBmc([&](Sim::Bmc& b) { b.sel.eraseTimestamp = erase; });
+            sim().withBmc([&](Sim::Bmc& b) {
+                b.sel.eraseTimestamp = erase;
+                b.sel.version = sel::supportedVersion;
+            });
             s.spoil();
             sim().resetCounters();
             EXPECT_EQ(IpmiIfcSelGetInfo(0, nullptr), 0u);
@@ -318,9 +352,13 @@ TEST_F(SelFollow, HostileAnswersEndWithinBounds) {
             EXPECT_LE(entryReads(), s.maxEntryReads);
         }
     }
+    // Command-line mode reloads at every call: version 0 ends there too.
+    ASSERT_EQ(IpmiIfcInitForCLI(0), 0);
+    EXPECT_EQ(IpmiIfcSelGetInfo(0, nullptr), 0u);
+    IpmiIfcCloseForCLI(0);
 }
 
-// The Parts' smaller promises, one scene: an empty log and a bad version
+// The smaller promises, one scene: an empty log and a bad version
 // fail the reload (the version message once per process); a clear whose
 // erasure is still in progress succeeds; the last-processed ID and the
 // clock go to the controller; the property line names the cached sensor.
@@ -524,63 +562,6 @@ TEST_F(SelOverTime, DeliveryResumesAfterTheCursor) {
         missed.push_back(logged.back());
         EXPECT_EQ(got.records, missed);
     }
-}
-
-// A pass is bounded by what the controller's answers justify and by a retry
-// budget for the whole pass, whatever it claims or however it fails; the
-// reload path never asks Get SEL Info again from within itself.
-// Every ID names a record, and every record has a next one.
-Sim::Response endlessChain(Sim::Bmc&, const Sim::Request& r) {
-    const uint16_t id = sel::le16(r.data.data() + sel::entryRequest::recordId);
-    const uint16_t own = id == 0 ? 1 : id;
-    Sim::Response out{cc::ok, uint8_t(own + 1), uint8_t((own + 1) >> 8)};
-    sel_event_record e = eventRecord(0x01, 0x01, 0x07);
-    sel::putLe16(e.record_id, own);
-    const Bytes bytes = bytesOf(e);
-    out.insert(out.end(), bytes.begin(), bytes.end());
-    return out;
-}
-
-TEST_F(SelFollow, APassEndsWithinItsBudget) {
-    const struct {
-        const char* what;
-        std::function<void(SelFollow&)> spoil;
-        unsigned maxExchanges;
-    } scenes[] = {
-        {"busy for ever", [](SelFollow& t) { t.sim().addFault(netfn::storage, cmd::getSelEntry, Sim::Fault::completionCode(cc::nodeBusy, -1)); }, 24},
-        {"every reservation cancelled", [](SelFollow& t) { t.sim().addFault(netfn::storage, cmd::getSelEntry, Sim::Fault::completionCode(cc::reservationCancelled, -1)); }, 2 * 24},
-        {"next IDs that never end, 0xFFFF entries claimed", [](SelFollow& t) {
-             t.bmc().on(netfn::storage, cmd::getSelEntry, endlessChain);
-             t.bend(false, true);
-         }, 4096 + 8},
-        {"version 0, erased at every answer", [](SelFollow& t) {
-             t.bmc().sel.version = 0;
-             auto standard = std::make_shared<Sim::Bmc>();
-             t.bmc().on(netfn::storage, cmd::getSelInfo, [standard](Sim::Bmc& b, const Sim::Request& r) {
-                 b.sel.eraseTimestamp += 1;
-                 standard->sel = b.sel;
-                 return standard->handle(r);
-             });
-         }, 8},
-    };
-    for (uint32_t erase : {0u, 1000u}) {
-        for (const auto& s : scenes) {
-            SCOPED_TRACE(std::string(s.what) + (erase ? ", reload" : ", incremental"));
-            useBmc(std::make_shared<Sim::Bmc>());
-            sim().clearFaults();
-            InitIpmiNode(0);
-            for (uint16_t i = 1; i <= 5; ++i) logEvent(i);
-            bmc().sel.eraseTimestamp = erase;
-            s.spoil(*this);
-            sim().resetCounters();
-            EXPECT_EQ(IpmiIfcSelGetInfo(0, nullptr), 0u);
-            EXPECT_LE(sim().totalExchanges(), s.maxExchanges);
-        }
-    }
-    // Command-line mode reloads at every call: version 0 ends there too.
-    ASSERT_EQ(IpmiIfcInitForCLI(0), 0);
-    EXPECT_EQ(IpmiIfcSelGetInfo(0, nullptr), 0u);
-    IpmiIfcCloseForCLI(0);
 }
 
 // ---- Direct synchroniser ---------------------------------------------------
