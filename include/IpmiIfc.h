@@ -219,9 +219,9 @@ public:
     /// @name System event log
     /// The loop reads the SEL's entry count on every pass; when the log grew
     /// it reads the new records (after an erase, the whole log) and hands
-    /// each event record stamped after the previous addition to every
-    /// registered handler, oldest first. Records present when start() runs
-    /// are loaded but not handed over. The getters answer from the cache.
+    /// each new event record once to every registered handler, oldest first.
+    /// Records present when start() runs are loaded but not handed over. The
+    /// getters answer from the cache.
     /// Ipmi::sync_device_eventlog reads the log without the loop.
     ///@{
 
