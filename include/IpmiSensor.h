@@ -19,9 +19,11 @@ namespace Ipmi {
 /// out); callers do not.
 ///
 /// Three kinds of calls:
-/// - *record* calls answer from the record copy: they send nothing, never
-///   block and never change (getSensorNumber(), getSensorType(), the unit
-///   and text calls, convertRawValue(), ...);
+/// - *record* calls answer from the record copy (its fields as IPMI defines
+///   them, 0 or false where the record type has no such field) and the
+///   library's tables: they send nothing, never block, never throw unless
+///   they say so, and never change (getSensorNumber(), getSensorType(), the
+///   unit and text calls, convertRawValue(), ...);
 /// - *cached* calls answer from what the loop's last pass stored
 ///   (getCachedState(), getReadingTime(), getLastPollResult(), and
 ///   getState(false)): they send nothing and wait only for the sensor's own
@@ -76,10 +78,8 @@ public:
     virtual int setEventEnable(unsigned char flags, unsigned short assertMask,
                                unsigned short deassertMask) = 0;
 
-    /// @name Record
-    /// Fields of the record copy, as IPMI defines them; 0 (or false) where
-    /// the record type has no such field.
-    ///@{
+    // Record fields, as IPMI defines them; 0 (or false) where the record
+    // type has no such field.
     unsigned char getSensorNumber() const { return sensor_number; }  ///< sensor number on its owner
     unsigned short getSensorRecordNumber() const { return record_id; }  ///< record ID in the SDR repository
     unsigned char getOwnerId() const;               ///< owner's IPMB address or software ID
@@ -127,7 +127,6 @@ public:
         FLAG_AUTO_REARM = 1 << 8,        ///< the sensor re-arms itself
         FLAG_PERCENTAGE = 1 << 12        ///< the reading is a percentage
     };
-    ///@}
 
     /// Asks the controller for the reading (one Get Sensor Reading, to the
     /// sensor's owner) and stores it; failures are logged and stored.
@@ -206,10 +205,7 @@ public:
     /// Re-arms every event of the sensor; one exchange.
     int rearmEvents();
 
-    /// @name Text
-    /// Words for the sensor from its record and the library's tables; they
-    /// send nothing and never throw.
-    ///@{
+    // Words for the sensor from its record and the library's tables.
     std::string getSensorTypeString() const;       ///< sensor type name ("Temperature")
     std::string getSensorDirectionString() const;  ///< "Unspecified", "input" or "output"
     std::string getModifierUnitString() const;     ///< the modifier unit's name, empty without one
@@ -226,7 +222,6 @@ public:
     static std::string DescFromType(unsigned char type);
     /// The name of a sensor direction code.
     static std::string DescFromDirection(unsigned char direction);
-    ///@}
 
     /// The result of the loop's last request for this sensor: 0, a completion
     /// code, or 0xFFFFFFFF when nothing could be sent.
