@@ -47,13 +47,13 @@ enum IPMI_POLL_TYPE {
 /// @ref contract-exceptions "exceptions", @ref contract-logging "logging".
 class TAV_IPMI_API IpmiIfc {
 public:
-    /// @name Lifecycle
+    /// @defgroup lifecycle Lifecycle
     /// A thread of the caller's runs start(), which returns only after
     /// stop(); other threads wait for IPMI_STATE_RUNNING with waitState() and
     /// then use the caches. One-shot tools use command-line mode instead
     /// (IpmiIfcInitForCLI). The state calls, doPoll() and the interval calls
     /// send nothing and never throw.
-    ///@{
+    /// @{
 
     /// Interface states; bit values, so that a wait can name several.
     enum IPMI_STATE {
@@ -150,13 +150,13 @@ public:
     /// handler: the loop cannot make a pass while one runs. The first call
     /// multiplies the SDR and FRU reload steps by `nodeCount`.
     static void pollAll(int nodeCount, bool serial, IPMI_POLL_TYPE type, bool* shutdown);
-    ///@}
+    /// @}
 
-    /// @name Sensors
+    /// @defgroup sensors Sensors
     /// The sensor list is built from the SDR repository when start() or
     /// IpmiIfcSdrGetInfo reads it, and rebuilt whole when the repository
     /// changes; the loop refreshes readings and thresholds in place.
-    ///@{
+    /// @{
 
     /// A copy of the node's sensor list, from the cache, in no set order
     /// (IpmiSensor::getSensorRecordNumber gives the repository's); empty
@@ -174,12 +174,12 @@ public:
     /// The last Get SDR Repository Info answer, from the cache; all zero
     /// before one. Waits while the SDR lists are being rebuilt.
     static ipmiifc_sdr_info getSdr(int node);
-    ///@}
+    /// @}
 
-    /// @name Entities
+    /// @defgroup entities Entities
     /// The entity list and the containment tree are rebuilt with the sensor
     /// list; both calls answer from the cache.
-    ///@{
+    /// @{
 
     /// A copy of the entities the SDR repository names, containers before
     /// what they contain.
@@ -192,14 +192,14 @@ public:
     static IpmiEntity getEntityParent(int node, unsigned int id, unsigned int instance);
     /// @overload
     static IpmiEntity getEntityParent(unsigned int id, unsigned int instance);
-    ///@}
+    /// @}
 
-    /// @name FRU inventory
+    /// @defgroup fru FRU inventory
     /// Every FRU device that a FRU device locator record names on the local
     /// controller, read whole at start and after SDR changes (or every 30
     /// periodic passes), and by IpmiIfcFruInstantiateAll. The list is
     /// replaced whole; devices and areas never change once handed out.
-    ///@{
+    /// @{
 
     /// A copy of the FRU device list, from the cache, in repository order.
     static std::vector<std::shared_ptr<IpmiFru>> getFrus(int node);
@@ -214,16 +214,16 @@ public:
 
     /// The last Get FRU Inventory Area Info answer of the node, from the cache.
     static ipmiifc_fru_area_info getFruDeviceHeader(int node);
-    ///@}
+    /// @}
 
-    /// @name System event log
+    /// @defgroup sel System event log
     /// The loop reads the SEL's entry count on every pass; when the log grew
     /// it reads the new records (after an erase, the whole log) and hands
     /// each new event record once to every registered handler, oldest first.
     /// Records present when start() runs are loaded but not handed over. The
     /// getters answer from the cache.
     /// Ipmi::sync_device_eventlog reads the log without the loop.
-    ///@{
+    /// @{
 
     /// Results of clearSel().
     enum SEL_CLEAR_RESULT {
@@ -299,12 +299,12 @@ public:
     static uint32_t GetSelClock();
     /// @copydoc GetSelClock()
     static uint32_t selGetClock(int node);
-    ///@}
+    /// @}
 
-    /// @name LAN
+    /// @defgroup lan LAN
     /// The controller's LAN settings live in one process-wide Ipmi::IpmiLan
     /// per node, refreshed by the loop on every periodic pass.
-    ///@{
+    /// @{
 
     /// The node's LAN settings object; valid for the life of the process.
     /// Sends nothing.
@@ -318,14 +318,14 @@ public:
     /// device and returns getLan(0). Not while the loop runs. A standard
     /// exception on the way is logged and passed on.
     static IpmiLan* GetBMCNetworking();
-    ///@}
+    /// @}
 
-    /// @name Identity
+    /// @defgroup identity Identity
     /// What start() (or GetBMCNetworking()) asked the controller once: its
     /// Get Device ID answer and the host OS name and version stored in it.
     /// These calls answer from the stored bytes, send nothing and never
     /// throw, except identifyChassis() and SetOSInfo().
-    ///@{
+    /// @{
 
     /// The controller's manufacturer name, "n/a" before an answer.
     static std::string GetBmcManufacturer();
@@ -376,10 +376,10 @@ public:
     /// Set when the manufacturer's name contains "Hewlett": the entity tree
     /// then leaves out power supply bays without a power sensor.
     static bool hpe_bmc;
-    ///@}
+    /// @}
 
-    /// @name Raw commands
-    ///@{
+    /// @defgroup raw Raw commands
+    /// @{
 
     /// Sends one command and copies the answer, completion code first, into
     /// `resp_buf`: one exchange. `*resp_len` is the buffer's size on entry
@@ -392,14 +392,14 @@ public:
     /// @overload
     static uint8_t sendCmd(uint8_t cmd, uint8_t netfn, uint16_t data_len, uint8_t* data,
                            uint16_t* resp_len, uint8_t* resp_buf);
-    ///@}
+    /// @}
 };
 
-/// @name Command-line mode
+/// @defgroup cli Command-line mode
 /// One-shot tools use the caches without the polling loop: open the device,
 /// prepare the node, load what the tool needs, read it with the IpmiIfc
 /// getters, and close. Calls of one tool run on one thread.
-///@{
+/// @{
 
 /// Prepares node 0 for command-line use (state IPMI_STATE_CLI) and loads the
 /// health rules; the device must already be open (IpmiIfcOpenIpmiOpen).
@@ -428,7 +428,7 @@ TAV_IPMI_API uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count);
 /// one Get FRU Inventory Area Info and a Read FRU Data per 8 to 23 bytes of
 /// each device. 0, or -1 for a node out of range.
 TAV_IPMI_API int IpmiIfcFruInstantiateAll(int node);
-///@}
+/// @}
 
 }  // namespace Ipmi
 
