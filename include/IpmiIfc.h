@@ -379,6 +379,8 @@ public:
     /// @}
 
     /// @defgroup raw Raw commands
+    /// Commands the library has no call for, through the same transport: one
+    /// request at a time on the device, with the loop's and other threads'.
     /// @{
 
     /// Sends one command and copies the answer, completion code first, into
