@@ -16,6 +16,8 @@ command -v pkg-config >/dev/null || need+=(pkg-config)
 [ -f /usr/include/nlohmann/json.hpp ] || need+=(nlohmann-json3-dev)
 [ -f /usr/include/httplib.h ] || need+=(libcpp-httplib-dev)
 command -v curl >/dev/null || need+=(curl)
+# The API reference and its check that every public declaration is documented.
+command -v doxygen >/dev/null || need+=(doxygen)
 # libFuzzer targets: clang and its sanitizer/fuzzer runtime, where the
 # distribution has them (the test script skips fuzzing without them).
 optional=()

@@ -28,6 +28,9 @@ build build -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=ON -DTAV_IPMI_BUILD
   -DTAV_IPMI_BUILD_VM_TESTS=ON -DTAV_IPMI_SANITIZE=
 ctest --test-dir build --output-on-failure -j"$jobs"
 
+echo "== API reference: every public declaration documented"
+scripts/docs-check.sh
+
 echo "== install"
 scripts/install-test.sh build
 
