@@ -142,6 +142,23 @@ public:
 
     // SDR repository.
     static ipmiifc_sdr_info getSdr(int node);
+    // The persistent SDR cache, off unless a directory is given here or in
+    // the environment variable TAV_IPMI_SDR_CACHE_DIR (this call wins; an
+    // empty directory turns the cache off). After every whole read of the
+    // repository the node's records are written to "sdr<node>.cache" there
+    // (the directory is created for its owner alone, the file is readable
+    // by its owner alone). An accepted Get SDR Repository Info answer whose
+    // record count and addition and erase stamps equal the file's, from a
+    // controller whose Get Device ID answer (device ID and revision,
+    // firmware and auxiliary firmware revision, manufacturer, product) and
+    // Get System GUID answer (where it gives one) equal the file's, fills the
+    // record lists from the file without Reserve SDR Repository or Get SDR;
+    // those two questions are asked each time the file is consulted. Any
+    // other file is ignored with one debug line and replaced after the read;
+    // a directory that cannot be written costs the cache, never the read.
+    static void setSdrCacheDir(const std::string& dir);
+    // The directory in use, "" when the cache is off.
+    static std::string getSdrCacheDir();
 
     // Sensors.
     static std::vector<std::shared_ptr<IpmiSensor>> getSensors(int node);
@@ -220,6 +237,15 @@ TAV_IPMI_API void IpmiIfcOpenIpmiClose(int node);
 // Reads the SDR repository when it changed and rebuilds sensors and entities
 // from it (the polling loop does this by itself; one-shot tools call it).
 TAV_IPMI_API uint32_t IpmiIfcSdrGetInfo(int node);
+// Reads the SDR repository (or the SDR cache, see IpmiIfc::setSdrCacheDir)
+// into the node's record lists as IpmiIfcSdrGetInfo does, but builds neither
+// sensors nor entities: for tools that need only the records, such as FRU
+// discovery (IpmiIfcFruInstantiateAll) or sensor names (IpmiIfcSensorDescribeAll).
+TAV_IPMI_API uint32_t IpmiIfcSdrReadRecords(int node);
+// Builds the node's sensor list from its record lists as discovery does,
+// without asking the controller anything: the sensors have their records,
+// names, entities and types, but no reading and no thresholds.
+TAV_IPMI_API int IpmiIfcSensorDescribeAll(int node);
 // Asks for the SEL info and follows a change: reads new records or reloads
 // the log (one-shot tools call it to load the SEL). `count` may be null.
 TAV_IPMI_API uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count);
