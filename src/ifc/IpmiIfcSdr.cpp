@@ -302,10 +302,6 @@ bool wholeRepositoryFiled(int node, const SdrCacheRecords& read) {
     return n.work.sdr.headers_valid && n.work.sdr.header_cnt != 0 && read.size() == n.work.sdr.header_cnt;
 }
 
-}  // namespace
-
-namespace {
-
 enum class Rebuild { sensorsAndEntities, nothing };
 
 uint32_t acceptSdrInfo(ipmiifc_resp* resp, Rebuild rebuild);
