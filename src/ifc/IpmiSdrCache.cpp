@@ -118,17 +118,18 @@ SdrCacheKey sdrCacheKey(const uint8_t* info, const uint8_t* deviceId) {
     namespace h = sdrcache::head;
     SdrCacheKey key;
     memset(key.bytes, 0, sizeof key.bytes);
-    uint8_t* k = key.bytes - h::keyFirst;  // indexed by file offsets
-    memcpy(k + h::recordCount, info + kInfoRecordCount, 2);
-    memcpy(k + h::additionStamp, info + kInfoAdditionStamp, 4);
-    memcpy(k + h::eraseStamp, info + kInfoEraseStamp, 4);
-    k[h::deviceId] = deviceId[deviceIdAt::deviceId];
-    k[h::deviceRevision] = deviceId[deviceIdAt::deviceRevision];
-    k[h::firmware1] = deviceId[deviceIdAt::firmware1];
-    k[h::firmware2] = deviceId[deviceIdAt::firmware2];
-    memcpy(k + h::manufacturer, deviceId + deviceIdAt::manufacturer, 3);
-    memcpy(k + h::product, deviceId + deviceIdAt::product, 2);
-    memcpy(k + h::auxFirmware, deviceId + deviceIdAt::auxFirmware, 4);
+    // Key bytes by their offset in the file.
+    auto at = [&key](size_t fileOffset) { return key.bytes + (fileOffset - h::keyFirst); };
+    memcpy(at(h::recordCount), info + kInfoRecordCount, 2);
+    memcpy(at(h::additionStamp), info + kInfoAdditionStamp, 4);
+    memcpy(at(h::eraseStamp), info + kInfoEraseStamp, 4);
+    *at(h::deviceId) = deviceId[deviceIdAt::deviceId];
+    *at(h::deviceRevision) = deviceId[deviceIdAt::deviceRevision];
+    *at(h::firmware1) = deviceId[deviceIdAt::firmware1];
+    *at(h::firmware2) = deviceId[deviceIdAt::firmware2];
+    memcpy(at(h::manufacturer), deviceId + deviceIdAt::manufacturer, 3);
+    memcpy(at(h::product), deviceId + deviceIdAt::product, 2);
+    memcpy(at(h::auxFirmware), deviceId + deviceIdAt::auxFirmware, 4);
     return key;
 }
 
