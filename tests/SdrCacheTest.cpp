@@ -122,6 +122,11 @@ TEST_F(SdrCache, OffByDefaultTheExchangesAreTheRepositoryReadAlone) {
 TEST_F(SdrCache, WarmStartRunsAfterOneRepositoryInfoAndDiscovery) {
     refresh();
     const std::vector<std::string> cold = sensors();
+    // start() clears the node record as a new process has it: nothing held.
+    IpmiIfcSdrCleanUpAll(0);
+    IpmiIfcSdrCleanUpHeaders(0);
+    IpmiIfcEntityCleanUpAll(0);
+    IpmiIfcSensorInstantiateAll(0);
     sim().resetCounters();
     {
         TestSupport::LoopThread loop(0);
