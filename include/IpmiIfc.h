@@ -152,8 +152,9 @@ public:
     // controller whose Get Device ID answer (device ID and revision,
     // firmware and auxiliary firmware revision, manufacturer, product) and
     // Get System GUID answer (where it gives one) equal the file's, fills the
-    // record lists from the file without Reserve SDR Repository or Get SDR;
-    // those two questions are asked each time the file is consulted. Any
+    // record lists from the file without Reserve SDR Repository or Get SDR.
+    // Get Device ID is asked each time the file is consulted, Get System
+    // GUID when the file holds a GUID and before a file is written. Any
     // other file is ignored with one debug line and replaced after the read;
     // a directory that cannot be written costs the cache, never the read.
     static void setSdrCacheDir(const std::string& dir);
