@@ -123,7 +123,9 @@ peer() {  # KEY EMPTY_OK COMMAND...
 }
 
 line() {  # OPERATION OUR_KEY PEER_KEY PEER_LABEL
-  row "$1" "\`${2/tavipmi-/tavipmi }\`" "${ex[$2]}" "${ms[$2]}" "$4" "${pex[$3]}" "${pms[$3]}"
+  local ours="\`${2/tavipmi-/tavipmi }\`"
+  case $2 in *-warm) ours="\`tavipmi ${2#tavipmi-}"; ours="${ours%-warm}\` (warm SDR cache)" ;; esac
+  row "$1" "$ours" "${ex[$2]}" "${ms[$2]}" "$4" "${pex[$3]}" "${pms[$3]}"
 }
 
 wanted=()
@@ -158,10 +160,16 @@ for profile in "${wanted[@]}"; do
       [ -n "${ex[$op]:-}" ] || fail "$profile_name: tav-ipmi-ops did not report $op"
       [ "$op" = cached ] || [ "${ex[$op]}" -gt 0 ] || fail "$profile_name: $op: the simulator answered nothing"
     done
+    # The tool's views from an empty SDR cache of their own, then again on
+    # the cache that run left (the peers' warm rows have theirs filled).
     for view in sensors sel fru; do
-      run 0 "$tool" "$view"
+      rm -rf "$work/tav-sdr-cache"
+      run 0 "$tool" --sdr-cache "$work/tav-sdr-cache" "$view"
       ex[tavipmi-$view]=$exchanges
       ms[tavipmi-$view]=$wall_ms
+      run 0 "$tool" --sdr-cache "$work/tav-sdr-cache" "$view"
+      ex[tavipmi-$view-warm]=$exchanges
+      ms[tavipmi-$view-warm]=$wall_ms
     done
 
     # Theirs. FreeIPMI keeps its SDR cache in a directory: empty for the cold
@@ -199,10 +207,11 @@ for profile in "${wanted[@]}"; do
     line FRU fru ipmi-fru "\`ipmi-fru\` (warm SDR cache)"
     line "sensors, process" tavipmi-sensors sensor "\`ipmitool sensor\`"
     line "sensors, process" tavipmi-sensors sensors-cold "\`ipmi-sensors\` (empty SDR cache)"
+    line "sensors, process, warm" tavipmi-sensors-warm sensors-warm "\`ipmi-sensors\` (warm SDR cache)"
     line "$sel_label, process" tavipmi-sel sel-elist "\`ipmitool sel elist\`"
-    line "$sel_label, process" tavipmi-sel ipmi-sel "\`ipmi-sel\` (warm SDR cache)"
+    line "$sel_label, process, warm" tavipmi-sel-warm ipmi-sel "\`ipmi-sel\` (warm SDR cache)"
     line "FRU, process" tavipmi-fru fru-print "\`ipmitool fru print\`"
-    line "FRU, process" tavipmi-fru ipmi-fru "\`ipmi-fru\` (warm SDR cache)"
+    line "FRU, process, warm" tavipmi-fru-warm ipmi-fru "\`ipmi-fru\` (warm SDR cache)"
   done
 done
 

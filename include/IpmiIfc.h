@@ -175,6 +175,26 @@ public:
     /// The last Get SDR Repository Info answer, from the cache; all zero
     /// before one. Waits while the SDR lists are being rebuilt.
     static ipmiifc_sdr_info getSdr(int node);
+
+    /// Turns the persistent SDR cache on in `dir`, or off with an empty
+    /// string; this call wins over the environment variable
+    /// TAV_IPMI_SDR_CACHE_DIR, and the cache is off without either. Sends
+    /// nothing; any thread, best before start(). After every whole read of
+    /// the repository the node's records are written to "sdr<node>.cache"
+    /// in `dir` (the directory created for its owner alone, the file
+    /// readable by its owner alone, written whole and renamed). An accepted
+    /// Get SDR Repository Info answer whose record count and addition and
+    /// erase stamps equal the file's, from a controller whose Get Device ID
+    /// answer (device ID and revision, firmware and auxiliary firmware
+    /// revision, manufacturer, product) and Get System GUID answer (where
+    /// the file holds one) equal the file's, fills the record lists from the
+    /// file without Reserve SDR Repository or Get SDR; Get Device ID is then
+    /// asked once more. Any other file is ignored with one debug line and
+    /// replaced after the read; a directory that cannot be written costs the
+    /// cache, never the read.
+    static void setSdrCacheDir(const std::string& dir);
+    /// The cache directory in use, "" when the cache is off. Any thread.
+    static std::string getSdrCacheDir();
     /// @}
 
     /// @defgroup entities Entities
@@ -428,6 +448,17 @@ TAV_IPMI_API void IpmiIfcOpenIpmiClose(int node);
 /// and sensor. 0, or 0xFFFFFFFF when the controller did not answer. The
 /// polling loop calls it by itself.
 TAV_IPMI_API uint32_t IpmiIfcSdrGetInfo(int node);
+/// Reads the SDR repository (or the SDR cache, see IpmiIfc::setSdrCacheDir)
+/// into the node's record lists as IpmiIfcSdrGetInfo does, but builds neither
+/// sensors nor entities: for tools that need only the records, such as FRU
+/// discovery (IpmiIfcFruInstantiateAll) or sensor names
+/// (IpmiIfcSensorDescribeAll). 0, or 0xFFFFFFFF when the controller did not answer.
+TAV_IPMI_API uint32_t IpmiIfcSdrReadRecords(int node);
+/// Builds the node's sensor list from its record lists as discovery does,
+/// without asking the controller anything: the sensors have their records,
+/// names, entities and types, but no reading and no thresholds. 0, or -1
+/// for a node out of range.
+TAV_IPMI_API int IpmiIfcSensorDescribeAll(int node);
 /// Asks for the SEL info (one exchange) and follows a change: reads the new
 /// records (one exchange each, plus a reservation) or reloads the log, and
 /// hands new records to the handlers while the loop runs. `count`, when not

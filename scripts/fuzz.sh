@@ -32,6 +32,7 @@ for t in "${targets[@]}"; do
       [ -d "$real/sdr" ] && seeds+=("$real/sdr")
       options+=(-max_len=4096) ;;
     HealthRulesFuzz) seeds+=(data) options+=(-max_len=2048) ;;
+    SdrCacheFuzz) options+=(-max_len=8192) ;;
   esac
   echo "== $t: ${seconds}s"
   # The fuzzer's own threads keep real time: the simulator's virtual clock is

@@ -86,6 +86,13 @@ void Bmc::registerStandardHandlers() {
                         id.auxFw[2],
                         id.auxFw[3]};
     });
+    on(netfn::app, cmd::getSystemGuid, [](Bmc& b, const Request& r) {
+        if (b.identity.guid.empty()) return ccOnly(cc::invalidCommand);
+        if (!lengthIs(r, 0)) return ccOnly(cc::requestDataLengthInvalid);
+        Response out{cc::ok};
+        out.insert(out.end(), b.identity.guid.begin(), b.identity.guid.end());
+        return out;
+    });
     on(netfn::app, cmd::getSelfTestResults, [](Bmc& b, const Request& r) {
         if (!lengthIs(r, 0)) return ccOnly(cc::requestDataLengthInvalid);
         return Response{cc::ok, b.selfTestResult, b.selfTestDetail};

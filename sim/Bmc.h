@@ -26,6 +26,8 @@ struct Identity {
     uint16_t productId = 0x0100;
     uint8_t auxFw[4] = {0, 0, 0, 0};
     bool hasDeviceSdrs = false;
+    // The system GUID Get System GUID answers; empty: the command is refused.
+    std::vector<uint8_t> guid;
 };
 
 // One system information parameter, stored as the 16-byte blocks a Set wrote.

@@ -5,9 +5,11 @@
 #include <gtest/gtest.h>
 #include <signal.h>
 #include <stdlib.h>
+#include <ftw.h>
 #include <unistd.h>
 
 #include <fstream>
+#include <map>
 #include <sstream>
 
 #include <nlohmann/json.hpp>
@@ -201,6 +203,72 @@ TEST(Tool, AnUnloadableProfileIsOneMessage) {
         EXPECT_EQ(run.exitCode, 2);
         EXPECT_EQ(run.err, c.message);
     }
+}
+
+// Exchanges per command of one run, keyed "netfn cmd" ("0a 23"), and "total".
+std::map<std::string, unsigned> countedRun(const std::string& profile, const std::vector<std::string>& args,
+                                           const std::string& cacheDir) {
+    const std::string countsFile = cacheDir + "/counts";
+    ToolRun run = TestSupport::runTool(profile, TAV_IPMI_TOOL, args,
+                                       {"TAV_IPMI_SDR_CACHE_DIR=" + cacheDir, "TAV_IPMI_SIM_COUNTS=" + countsFile});
+    EXPECT_EQ(run.exitCode, 0) << run.err;
+    std::map<std::string, unsigned> counts;
+    std::ifstream in(countsFile);
+    std::string line;
+    while (std::getline(in, line)) {
+        const size_t last = line.rfind(' ');
+        if (last != std::string::npos) counts[line.substr(0, last)] = std::stoul(line.substr(last + 1));
+    }
+    unlink(countsFile.c_str());
+    return counts;
+}
+
+unsigned sensorCommands(const std::map<std::string, unsigned>& counts) {
+    unsigned n = 0;
+    for (const auto& c : counts) n += c.first.rfind("04 ", 0) == 0 ? c.second : 0;
+    return n;
+}
+
+// With a warm SDR cache each view asks only what it shows: no repository
+// read, and no sensor command where no reading is shown.
+TEST(Tool, WarmViewsReadOnlyWhatTheyShow) {
+    const unsigned any = ~0u;
+    const struct {
+        std::string profile;
+        std::vector<std::string> args;
+        unsigned maxTotal, sdrInfo, sdrReads, sensorCommands;
+    } cases[] = {
+        {"default", {"identity"}, any, 0, 0, 0},
+        {"default", {"lan"}, any, 0, 0, 0},
+        {"default", {"sel"}, 12, 1, 0, 0},
+        {"default", {"fru"}, 36, 1, 0, 0},
+        {"default", {"sensors"}, any, 1, 0, any},
+        {"default", {"--no-sdr-cache", "sel"}, any, 1, any, 0},
+        {"generated:1000", {"sel"}, 504, 1, 0, 0},
+        {"generated:1000", {"fru"}, 36, 1, 0, 0},
+        {"generated:1000", {"sensors"}, any, 1, 0, any},
+    };
+    char dir[] = "/tmp/tav-tool-warm-XXXXXX";
+    ASSERT_NE(mkdtemp(dir), nullptr);
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.profile + " " + c.args.back() + " " + c.args.front());
+        countedRun(c.profile, c.args, dir);
+        auto warm = countedRun(c.profile, c.args, dir);
+        if (c.maxTotal != any) {
+            EXPECT_LE(warm["total"], c.maxTotal);
+        }
+        EXPECT_EQ(warm["0a 20"], c.sdrInfo);
+        if (c.sdrReads != any) {
+            EXPECT_EQ(warm["0a 22"] + warm["0a 23"], c.sdrReads);
+        } else {
+            EXPECT_GT(warm["0a 23"], 0u);
+        }
+        if (c.sensorCommands != any) {
+            EXPECT_EQ(sensorCommands(warm), c.sensorCommands);
+        }
+    }
+    nftw(
+        dir, [](const char* p, const struct stat*, int, struct FTW*) { return remove(p); }, 16, FTW_DEPTH | FTW_PHYS);
 }
 
 // Every view and option that --help lists is described in the manual page.

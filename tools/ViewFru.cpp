@@ -86,7 +86,8 @@ Tool::Json device(const Ipmi::IpmiFru& fru, Tool::Section& section) {
 
 int showFru(std::vector<Tool::Section>& out) {
     // Without a polling loop nothing has read the repository or the devices yet.
-    if (Ipmi::IpmiIfcSdrGetInfo(0) != 0) fprintf(stderr, "tavipmi: could not read the SDR repository\n");
+    // FRU discovery needs the FRU locator records, not the sensors.
+    if (Ipmi::IpmiIfcSdrReadRecords(0) != 0) fprintf(stderr, "tavipmi: could not read the SDR repository\n");
     Ipmi::IpmiIfcFruInstantiateAll(0);
     Tool::Section s;
     s.name = "fru";

@@ -25,7 +25,9 @@ namespace {
 
 // The controller's event log, oldest record first.
 int showSel(std::vector<Tool::Section>& out) {
-    Ipmi::IpmiIfcSdrGetInfo(0);  // sensor names
+    // Sensor names come from the records alone: no reading, no threshold.
+    Ipmi::IpmiIfcSdrReadRecords(0);
+    Ipmi::IpmiIfcSensorDescribeAll(0);
     Tool::Section s;
     s.name = "sel";
     s.title = "System event log";

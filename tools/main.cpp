@@ -1,10 +1,12 @@
 // tavipmi: views of the host's BMC through tav-ipmi, and a metrics endpoint.
 
+#include <dlfcn.h>
 #include <errno.h>
 #include <limits.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -83,6 +85,25 @@ int reexecSimulated(char** argv, const std::string& profile) {
 #endif
 }
 
+// Where this run keeps its SDR cache. A simulated controller gets a
+// directory per profile (and per version of the profile's file): its
+// identity and stamps are made up, and must never meet a real controller's
+// records or another profile's.
+std::string sdrCacheDirectory(const std::string& chosen) {
+    if (dlsym(RTLD_DEFAULT, "tavIpmiSimAddSelEvent") == nullptr) return chosen;
+    const char* profile = getenv("TAV_IPMI_SIM_PROFILE");
+    std::string identity = profile != nullptr ? profile : "default";
+    struct stat st;
+    if (stat(identity.c_str(), &st) == 0)
+        identity += "\n" + std::to_string(st.st_size) + "\n" + std::to_string(st.st_mtim.tv_sec) + "." +
+                    std::to_string(st.st_mtim.tv_nsec);
+    uint64_t hash = 1469598103934665603ull;  // FNV-1a
+    for (unsigned char c : identity) hash = (hash ^ c) * 1099511628211ull;
+    char name[40];
+    snprintf(name, sizeof name, "/simulated-%016llx", static_cast<unsigned long long>(hash));
+    return chosen + name;
+}
+
 // Views in the order of the default output.
 std::vector<std::string> defaultViews() {
     std::vector<std::pair<int, std::string>> order;
@@ -149,6 +170,14 @@ int main(int argc, char** argv) {
     app.add_option("--format", format, "output format: table, json or csv (default table)")
         ->transform(CLI::CheckedTransformer(formats))
         ->option_text("table|json|csv");
+    const char* cacheFromEnvironment = getenv("TAV_IPMI_SDR_CACHE_DIR");
+    std::string sdrCache = cacheFromEnvironment != nullptr ? cacheFromEnvironment : "/var/cache/tav-ipmi";
+    app.add_option("--sdr-cache", sdrCache,
+                   "keep the SDR repository in this directory between runs (default "
+                   "$TAV_IPMI_SDR_CACHE_DIR or /var/cache/tav-ipmi)")
+        ->option_text("DIR");
+    bool noSdrCache = false;
+    app.add_flag("--no-sdr-cache", noSdrCache, "read the SDR repository afresh and keep no copy");
     app.require_subcommand(0, 1);
     app.fallthrough();  // the global options may follow the view
     std::map<CLI::App*, std::string> byCommand;
@@ -172,6 +201,7 @@ int main(int argc, char** argv) {
         return reexecSimulated(argv, profile.empty() ? "default" : profile);
 
     Tool::chosenFormat = format;
+    Ipmi::IpmiIfc::setSdrCacheDir(noSdrCache || sdrCache.empty() ? "" : sdrCacheDirectory(sdrCache));
     std::vector<std::string> selected;
     for (CLI::App* sub : app.get_subcommands()) selected.push_back(byCommand[sub]);
     if (selected.empty()) selected = defaultViews();

@@ -34,6 +34,7 @@ constexpr uint8_t reserveDeviceSdrRepository = 0x22;
 // App
 constexpr uint8_t getDeviceId = 0x01;
 constexpr uint8_t getSelfTestResults = 0x04;
+constexpr uint8_t getSystemGuid = 0x37;
 constexpr uint8_t getChannelInfo = 0x42;
 constexpr uint8_t setSystemInfoParameters = 0x58;
 constexpr uint8_t getSystemInfoParameters = 0x59;

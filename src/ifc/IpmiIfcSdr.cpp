@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "IpmiIfcInternal.h"
+#include "IpmiSdrCache.h"
 #include "SdrLayout.h"
 
 namespace Ipmi {
@@ -223,18 +224,98 @@ void rebuildFromRecords(int node) {
     IpmiIfcEntityInstantiateAll(node);
 }
 
-}  // namespace
+// While a chain keeps what it reads for the SDR cache: the records as read,
+// in walk order (IpmiIfcSdrReadAll appends to it).
+thread_local SdrCacheRecords* t_recordsRead = nullptr;
 
-uint32_t IpmiIfcSdrGetInfo(int node) {
+class KeepRecordsRead {
+public:
+    explicit KeepRecordsRead(SdrCacheRecords* into) { t_recordsRead = into; }
+    ~KeepRecordsRead() { t_recordsRead = nullptr; }
+    KeepRecordsRead(const KeepRecordsRead&) = delete;
+    KeepRecordsRead& operator=(const KeepRecordsRead&) = delete;
+};
+
+constexpr size_t kDeviceIdBytes = 16;
+constexpr size_t kGuidAnswerBytes = 17;  // completion code, GUID
+
+// The key a cache file must carry for the info just accepted. The identity
+// is asked afresh, so a firmware update or a swapped controller never meets
+// the records of the one before. False when in doubt: no identity answer.
+bool askCacheKey(int node, const uint8_t* info, SdrCacheKey* key) {
+    uint8_t deviceId[kDeviceIdBytes] = {};
+    RespHolder id(IpmiIfcSendCmd(node, cmd::getDeviceId, netfn::app, 0, 0, nullptr, 0));
+    if (!id || id->cc != cc::ok) return false;
+    memcpy(deviceId, id->data, id->data_len < kDeviceIdBytes ? id->data_len : kDeviceIdBytes);
+    *key = sdrCacheKey(info, deviceId);
+    return true;
+}
+
+// Controllers without a GUID refuse the command; their key has none.
+void askCacheGuid(int node, SdrCacheKey* key) {
+    RespHolder guid(IpmiIfcSendCmd(node, cmd::getSystemGuid, netfn::app, 0, 0, nullptr, 0));
+    if (guid && guid->cc == cc::ok && guid->data_len >= kGuidAnswerBytes) sdrCacheKeyAddGuid(key, guid->data + 1);
+}
+
+// Files the records of a valid cache file in place of the node's lists, as
+// a whole read would have left them. False: no valid file, nothing changed.
+bool fileFromCache(int node, const SdrCacheFile& file, const SdrCacheKey& key) {
+    SdrCacheRecords records;
+    if (!sdrCacheUse(file, key, &records)) return false;
+    // Everything allocated before the lists are touched: a failure leaves them be.
+    using Element = std::unique_ptr<ipmiifc_sdr_list, void (*)(ipmiifc_sdr_list*)>;
+    std::vector<Element> elements;
+    elements.reserve(records.size());
+    std::unique_ptr<uint8_t[]> headers(new (std::nothrow) uint8_t[records.size() * sdr::header::length + 1]);
+    if (!headers) return false;
+    for (size_t i = 0; i < records.size(); ++i) {
+        const std::vector<uint8_t>& r = records[i];
+        Element element(new (std::nothrow) ipmiifc_sdr_list(), freeRecord);
+        if (!element) return false;
+        element->data = new (std::nothrow) uint8_t[r.size()];
+        if (element->data == nullptr) return false;
+        memcpy(element->data, r.data(), r.size());
+        const sdr::SdrView header(element->data, r.size());
+        element->record_id = header.recordId();
+        element->record_type = header.recordType();
+        element->length = static_cast<uint8_t>(r.size());  // the reader kept it within a length byte
+        memcpy(headers.get() + i * sdr::header::length, element->data, sdr::header::length);
+        elements.push_back(std::move(element));
+    }
+    IpmiIfcSdrCleanUpAll(node);
+    IpmiNode& n = g_IpmiNode[node];
+    CacheWriteLock guard(n.cacheLock);
+    ipmiifc_sdr_state& s = n.work.sdr;
+    delete[] s.headers;
+    s.headers = headers.release();
+    s.header_cnt = static_cast<uint32_t>(records.size());
+    s.headers_valid = 1;
+    for (auto& element : elements) IpmiIfcSdrListAdd(node, element.release());
+    return true;
+}
+
+// Whether the last read filed every record its walk found: only then is it
+// worth keeping.
+bool wholeRepositoryFiled(int node, const SdrCacheRecords& read) {
+    IpmiNode& n = g_IpmiNode[node];
+    CacheWriteLock guard(n.cacheLock);
+    return n.work.sdr.headers_valid && n.work.sdr.header_cnt != 0 && read.size() == n.work.sdr.header_cnt;
+}
+
+enum class Rebuild { sensorsAndEntities, nothing };
+
+uint32_t acceptSdrInfo(ipmiifc_resp* resp, Rebuild rebuild);
+
+uint32_t getSdrInfo(int node, Rebuild rebuild) {
     if (!validNode(node)) return kFailed;
     SdrChainLock chain;
     RespHolder resp(IpmiIfcSendCmd(node, cmd::getSdrRepositoryInfo, netfn::storage, 0, 0, nullptr, 0));
     if (!resp || resp->cc != cc::ok) return kFailed;
-    IpmiIfcRhGetSdrInfo(resp.get());
+    acceptSdrInfo(resp.get(), rebuild);
     return 0;
 }
 
-uint32_t IpmiIfcRhGetSdrInfo(ipmiifc_resp* resp) {
+uint32_t acceptSdrInfo(ipmiifc_resp* resp, Rebuild rebuild) {
     if (resp == nullptr) return kFailed;
     if (resp->cc != cc::ok) {
         ipmiLog(LOG_WARNING, "Unable to fetch SDR info - cc=0x%x", resp->cc);
@@ -264,11 +345,37 @@ uint32_t IpmiIfcRhGetSdrInfo(ipmiifc_resp* resp) {
         CacheWriteLock guard(n.cacheLock);
         memcpy(n.work.sdr.info, resp->data, kInfoBytes);
     }
-    IpmiIfcSdrReserve(node);
-    IpmiIfcSdrGetAll(node);
-    rebuildFromRecords(node);
+    // The cache is consulted only when asked for: without it the exchanges
+    // are the ones a reader of the repository expects.
+    SdrCacheKey key;
+    const bool cached = !sdrCacheDirectory().empty() && askCacheKey(node, resp->data, &key);
+    bool filed = false;
+    if (cached) {
+        const SdrCacheFile file = sdrCacheRead(node);
+        // The GUID is asked for only where the file has one to compare with;
+        // a file without one is replaced by one with the GUID asked below.
+        const bool guidAsked = sdrCacheHasGuid(file);
+        if (guidAsked) askCacheGuid(node, &key);
+        filed = fileFromCache(node, file, key);
+        if (!filed && !guidAsked) askCacheGuid(node, &key);
+    }
+    if (!filed) {
+        IpmiIfcSdrReserve(node);
+        SdrCacheRecords read;
+        KeepRecordsRead keep(cached ? &read : nullptr);
+        if (IpmiIfcSdrGetAll(node) == 0 && cached && wholeRepositoryFiled(node, read)) sdrCacheStore(node, key, read);
+    }
+    if (rebuild == Rebuild::sensorsAndEntities) rebuildFromRecords(node);
     return 0;
 }
+
+}  // namespace
+
+uint32_t IpmiIfcSdrGetInfo(int node) { return getSdrInfo(node, Rebuild::sensorsAndEntities); }
+
+uint32_t IpmiIfcSdrReadRecords(int node) { return getSdrInfo(node, Rebuild::nothing); }
+
+uint32_t IpmiIfcRhGetSdrInfo(ipmiifc_resp* resp) { return acceptSdrInfo(resp, Rebuild::sensorsAndEntities); }
 
 uint32_t IpmiIfcSdrReserve(int node) {
     if (!validNode(node)) return kFailed;
@@ -479,6 +586,7 @@ uint32_t IpmiIfcSdrReadAll(int node) {
         element->record_type = header.recordType();
         element->length = size;
         element->data = bytes;
+        if (t_recordsRead != nullptr) t_recordsRead->emplace_back(bytes, bytes + size);
         IpmiIfcSdrListAdd(node, element);
     }
     return 0;

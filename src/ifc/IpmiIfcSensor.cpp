@@ -149,7 +149,10 @@ void logDropped(const ipmiifc_sdr_list* element, uint8_t eventReadingType) {
                 eventReadingType);
 }
 
-void instantiateSensorRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list, bool& memoryEvents) {
+// Whether discovery asks each new sensor for its thresholds and reading.
+enum class Ask { controller, nothing };
+
+void instantiateSensorRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list, bool& memoryEvents, Ask ask) {
     for (ipmiifc_sdr_list* element = list; element != nullptr; element = element->next) {
         const sdr::SensorRecordView rec = viewOf(element);
         if (rec.sensorType() == kSensorTypeMemory && (rec.assertionMask() != 0 || rec.deassertionMask() != 0))
@@ -161,13 +164,14 @@ void instantiateSensorRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list, boo
         }
         std::shared_ptr<IpmiSensor> sensor = makeSensor(node, kind, element);
         offer(n, element, sensor);
+        if (ask == Ask::nothing) continue;
         if (kind == SensorClass::threshold) IpmiIfcSensorGetThresholds(node, element, sensor);
         readInto(node, element, *sensor);
     }
 }
 
 // Event-only sensors have nothing to read; only threshold ones are asked for thresholds.
-void instantiateEventOnlyRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list, bool& memoryEvents) {
+void instantiateEventOnlyRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list, bool& memoryEvents, Ask ask) {
     for (ipmiifc_sdr_list* element = list; element != nullptr; element = element->next) {
         const sdr::EventOnlyView rec(element->data, element->length);
         if (rec.sensorType() == kSensorTypeMemory) memoryEvents = true;
@@ -175,13 +179,11 @@ void instantiateEventOnlyRecords(int node, IpmiNode& n, ipmiifc_sdr_list* list, 
         if (kind == SensorClass::none) continue;
         std::shared_ptr<IpmiSensor> sensor = makeSensor(node, kind, element);
         offer(n, element, sensor);
-        if (kind == SensorClass::threshold) IpmiIfcSensorGetThresholds(node, element, sensor);
+        if (ask == Ask::controller && kind == SensorClass::threshold) IpmiIfcSensorGetThresholds(node, element, sensor);
     }
 }
 
-}  // namespace
-
-int IpmiIfcSensorInstantiateAll(int node) {
+int instantiateAll(int node, Ask ask) {
     if (!validNode(node)) return kNotSent;
     IpmiNode& n = g_IpmiNode[node];
     // Held for the whole pass, requests included: callers see the old list or the new one.
@@ -192,9 +194,9 @@ int IpmiIfcSensorInstantiateAll(int node) {
     // stored once, so a rebuild never shows it cleared for a moment.
     bool memoryEvents = false;
     try {
-        instantiateSensorRecords(node, n, n.work.sdr.lists[SDR_GROUP_FULL], memoryEvents);
-        instantiateSensorRecords(node, n, n.work.sdr.lists[SDR_GROUP_COMPACT], memoryEvents);
-        instantiateEventOnlyRecords(node, n, n.work.sdr.lists[SDR_GROUP_EVENT_ONLY], memoryEvents);
+        instantiateSensorRecords(node, n, n.work.sdr.lists[SDR_GROUP_FULL], memoryEvents, ask);
+        instantiateSensorRecords(node, n, n.work.sdr.lists[SDR_GROUP_COMPACT], memoryEvents, ask);
+        instantiateEventOnlyRecords(node, n, n.work.sdr.lists[SDR_GROUP_EVENT_ONLY], memoryEvents, ask);
     } catch (const std::bad_alloc&) {
         // Out of memory: callers get the sensors built so far.
         ipmiLog(LOG_ERR, "%s: failed memory alloc.", "IpmiIfcSensorInstantiateAll");
@@ -202,6 +204,12 @@ int IpmiIfcSensorInstantiateAll(int node) {
     __atomic_store_n(&n.work.memory_events, static_cast<uint8_t>(memoryEvents), __ATOMIC_RELEASE);
     return 0;
 }
+
+}  // namespace
+
+int IpmiIfcSensorInstantiateAll(int node) { return instantiateAll(node, Ask::controller); }
+
+int IpmiIfcSensorDescribeAll(int node) { return instantiateAll(node, Ask::nothing); }
 
 int IpmiIfcSensorGetThresholds(int node, ipmiifc_sdr_list* element, std::shared_ptr<IpmiSensor> sensor) {
     if (element == nullptr || element->data == nullptr || !sensor || !validNode(node)) return kNoSdrElement;

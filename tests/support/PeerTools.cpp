@@ -51,6 +51,23 @@ std::vector<char*> pointers(std::vector<std::string>& strings) {
 
 bool hasPrefix(const char* s, const char* prefix) { return strncmp(s, prefix, strlen(prefix)) == 0; }
 
+// A test never leaves an SDR cache in the system's directory.
+std::string processCacheDirectory() {
+    static const std::string dir = [] {
+        char path[] = "/tmp/tav-tool-cache-XXXXXX";
+        if (mkdtemp(path) == nullptr) return std::string("/nonexistent");
+        static std::string removed;
+        removed = path;
+        atexit([] {
+            nftw(
+                removed.c_str(), [](const char* p, const struct stat*, int, struct FTW*) { return remove(p); }, 16,
+                FTW_DEPTH | FTW_PHYS);
+        });
+        return std::string(path);
+    }();
+    return dir;
+}
+
 }  // namespace
 
 std::string toolPath(const std::string& name) {
@@ -72,6 +89,10 @@ ToolRun runTool(const std::string& profile, const std::string& tool, const std::
     for (char** e = environ; *e; ++e)
         if (!hasPrefix(*e, "LD_PRELOAD=") && !hasPrefix(*e, "TAV_IPMI_SIM_") && !hasPrefix(*e, "ASAN_OPTIONS="))
             env.push_back(*e);
+    bool cacheChosen = getenv("TAV_IPMI_SDR_CACHE_DIR") != nullptr;
+    for (const auto& e : extraEnv) cacheChosen = cacheChosen || hasPrefix(e.c_str(), "TAV_IPMI_SDR_CACHE_DIR=");
+    if (!cacheChosen) env.push_back("TAV_IPMI_SDR_CACHE_DIR=" + processCacheDirectory());
+    env.insert(env.end(), extraEnv.begin(), extraEnv.end());
     if (!profile.empty()) {
         std::string runtime = sanitizerRuntime();
         env.push_back("LD_PRELOAD=" + (runtime.empty() ? "" : runtime + ":") + TAV_IPMI_PRELOAD_LIB);
@@ -80,7 +101,6 @@ ToolRun runTool(const std::string& profile, const std::string& tool, const std::
         // The tools free little before they exit; their leaks are not ours to report.
         env.push_back("ASAN_OPTIONS=detect_leaks=0");
     }
-    env.insert(env.end(), extraEnv.begin(), extraEnv.end());
     std::vector<std::string> argStrings{tool};
     argStrings.insert(argStrings.end(), args.begin(), args.end());
     std::vector<char*> envp = pointers(env), argv = pointers(argStrings);

@@ -25,7 +25,8 @@ std::string toolPath(const std::string& name);
 // `profile` (a path, or "default"; empty: no simulator at all). Time is
 // virtual, so requests the controller leaves unanswered cost nothing.
 // `extraEnv` adds NAME=VALUE entries; the tool is killed (SIGALRM) after
-// `seconds` of real time.
+// `seconds` of real time. tavipmi keeps its SDR cache in a directory of this
+// test process unless TAV_IPMI_SDR_CACHE_DIR says otherwise.
 ToolRun runTool(const std::string& profile, const std::string& tool, const std::vector<std::string>& args,
                 const std::vector<std::string>& extraEnv = {}, unsigned seconds = 60);
 
