@@ -264,10 +264,11 @@ ChainWalk walkChain(int node, uint16_t from, bool fromIsHeld, uint32_t requests,
     return ChainWalk{ChainEnd::Cut, 0, 0, false};
 }
 
-// Reads the log again from its start, keeping what was handled.
-bool reload(int node) {
+// Reads the log again from its start, keeping what was handled (command-line
+// mode hands nothing over, so it keeps nothing either).
+bool reload(int node, bool carry) {
     std::vector<std::shared_ptr<IpmiSelData>> previous;  // released outside the lock
-    takeRecords(node, previous, true);
+    takeRecords(node, previous, carry);
     previous.clear();
     bool whole = false;
     getAll(node, &whole);
@@ -340,11 +341,14 @@ uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
                 storeHeader(n, resp->data, node);
                 n.work.sel.last_record_id = 0;
             }
-            whole = reload(node);
+            whole = reload(node, true);
         } else {
             if (w.end == ChainEnd::Failed && !w.atFirst)
                 ipmiLog(LOG_ERR, "%s: failed call to IpmiIfcSelReadEntry cc = 0x%x", "IpmiIfcSelReadNew", w.rc & 0xFF);
-            whole = w.end == ChainEnd::LogEnd;
+            // A next ID the controller says holds no record ends its log as
+            // surely as 0xFFFF; reading on would only fail again.
+            whole = w.end == ChainEnd::LogEnd ||
+                    (w.end == ChainEnd::Failed && !w.atFirst && w.code == cc::requestedSensorNotPresent);
         }
         TAV::MutexLock guard(n.selMutex);
         storeHeader(n, resp->data, node);
@@ -357,7 +361,7 @@ uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
             if (!nothingStored) f.foundAtStart = 0;
         }
         IpmiIfcSelReserve(node);
-        whole = reload(node);
+        whole = reload(node, !cli);
     }
     endPass(node, whole);
     if (t_delivering == 0) deliverDue(node);
