@@ -210,6 +210,51 @@ public:
     // LAN configuration.
     static IpmiLan* getLan(int node);
     static IpmiLan* getLan();
+
+    // Observation of the polling loop, for monitoring. Observing sends
+    // nothing: every getter reads values the loop and the transport store
+    // atomically, from any thread, while the loop runs. Node 0 serves every
+    // node. Times are Unix seconds of the time of day, 0 when never.
+
+    // The caches the loop refreshes.
+    enum IPMI_CACHE {
+        IPMI_CACHE_SENSORS = 0,  // sensor readings and thresholds
+        IPMI_CACHE_SDR = 1,      // SDR repository (and the sensors and entities built from it)
+        IPMI_CACHE_SEL = 2,      // SEL info and records
+        IPMI_CACHE_FRU = 3,      // FRU inventory
+        IPMI_CACHE_LAN = 4,      // LAN settings
+        IPMI_CACHE_COUNT = 5
+    };
+    // How an exchange with the controller ended.
+    enum IPMI_EXCHANGE_RESULT {
+        IPMI_EXCHANGE_OK = 0,               // answered with completion code 0
+        IPMI_EXCHANGE_COMPLETION_CODE = 1,  // answered with another completion code, time-out excepted
+        IPMI_EXCHANGE_TIMEOUT = 2,          // no answer in time, or the driver's time-out code 0xC3
+        IPMI_EXCHANGE_ERROR = 3,            // the device failed (send, wait or receive), or is not open
+        IPMI_EXCHANGE_RESULT_COUNT = 4
+    };
+    // When the loop's last pass ended (the set-up reads before the first
+    // wait count as a pass).
+    static double getLastPassTime(int node);
+    static double getLastPassTime();
+    // Whether the last pass reached the controller: at least one of its
+    // exchanges was answered by the controller (time-outs are not answers).
+    static bool lastPassReachedController(int node);
+    static bool lastPassReachedController();
+    // When the last pass that reached the controller ended.
+    static double getLastSuccessfulPassTime(int node);
+    static double getLastSuccessfulPassTime();
+    // How long the last pass took, in seconds.
+    static double getLastPassDuration(int node);
+    static double getLastPassDuration();
+    // When the loop last refreshed a cache: the refresh succeeded and none of
+    // its exchanges timed out or failed. 0 for an unknown cache.
+    static double getCacheRefreshTime(int node, IPMI_CACHE cache);
+    static double getCacheRefreshTime(IPMI_CACHE cache);
+    // Exchanges with the controller since the process started, by result;
+    // every thread's exchanges count, the loop's and callers' own.
+    static uint64_t getExchangeCount(int node, IPMI_EXCHANGE_RESULT result);
+    static uint64_t getExchangeCount(IPMI_EXCHANGE_RESULT result);
 };
 
 // Command-line mode: no polling loop; the caller opens the device first.

@@ -15,6 +15,10 @@ command -v pkg-config >/dev/null || need+=(pkg-config)
 [ -f /usr/include/CLI/CLI.hpp ] || need+=(libcli11-dev)
 [ -f /usr/include/nlohmann/json.hpp ] || need+=(nlohmann-json3-dev)
 [ -f /usr/include/httplib.h ] || need+=(libcpp-httplib-dev)
+# `serve --web.config.file`: TLS, the file's YAML, bcrypt password hashes.
+[ -f /usr/include/openssl/ssl.h ] || need+=(libssl-dev)
+[ -f /usr/include/yaml-cpp/yaml.h ] || need+=(libyaml-cpp-dev)
+[ -f /usr/include/crypt.h ] || need+=(libcrypt-dev)
 command -v curl >/dev/null || need+=(curl)
 # libFuzzer targets: clang and its sanitizer/fuzzer runtime, where the
 # distribution has them (the test script skips fuzzing without them).

@@ -10,14 +10,15 @@ cd "$(dirname "$0")/.."
 build=$(cd "${1:-build}" && pwd)
 tool="$build/tools/tavipmi"
 
-if ! command -v prometheus >/dev/null; then
+am=prometheus-alertmanager
+if ! command -v prometheus >/dev/null || ! command -v promtool >/dev/null || ! command -v $am >/dev/null; then
   sudo=""
   [ "$(id -u)" -ne 0 ] && sudo="sudo"
-  { $sudo apt-get update -qq && DEBIAN_FRONTEND=noninteractive $sudo apt-get install -y -qq --no-install-recommends prometheus; } \
-    >/dev/null 2>&1 || true
+  { $sudo apt-get update -qq && DEBIAN_FRONTEND=noninteractive $sudo apt-get install -y -qq --no-install-recommends \
+      prometheus prometheus-alertmanager; } >/dev/null 2>&1 || true
 fi
-if ! command -v prometheus >/dev/null; then
-  echo "prometheus test: skipped (Debian's prometheus cannot be installed)"
+if ! command -v prometheus >/dev/null || ! command -v promtool >/dev/null || ! command -v $am >/dev/null; then
+  echo "prometheus test: skipped (Debian's prometheus and prometheus-alertmanager cannot be installed)"
   exit 0
 fi
 for need in curl python3; do command -v $need >/dev/null || { echo "prometheus test: $need missing" >&2; exit 1; }; done
