@@ -18,11 +18,12 @@ build=$(cd "${1:-build}" && pwd)
 tool="$build/tools/tavipmi"
 
 am=prometheus-alertmanager
-if ! command -v prometheus >/dev/null || ! command -v promtool >/dev/null || ! command -v $am >/dev/null; then
+if ! command -v prometheus >/dev/null || ! command -v promtool >/dev/null || ! command -v $am >/dev/null ||
+  ! command -v openssl >/dev/null; then
   sudo=""
   [ "$(id -u)" -ne 0 ] && sudo="sudo"
   { $sudo apt-get update -qq && DEBIAN_FRONTEND=noninteractive $sudo apt-get install -y -qq --no-install-recommends \
-      prometheus prometheus-alertmanager; } >/dev/null 2>&1 || true
+      prometheus prometheus-alertmanager openssl; } >/dev/null 2>&1 || true
 fi
 if ! command -v prometheus >/dev/null || ! command -v promtool >/dev/null || ! command -v $am >/dev/null; then
   echo "prometheus test: skipped (Debian's prometheus and prometheus-alertmanager cannot be installed)"
@@ -231,6 +232,8 @@ kill -s RTMIN+1 "$serve_pid"
 silent_time=$(scene BmcDown "$changed" 120)
 [ "$(value 'tavipmi_up')" -eq 0 ] || fail "tavipmi_up is not 0 with the controller silent"
 [ "$(value 'tavipmi_exchanges_total{result="timeout"}')" -ge 10 ] || fail "the time-outs are not counted"
+# Ten Get SEL Info tries a second apart.
+[ "$(value 'tavipmi_last_pass_duration_seconds')" -ge 9 ] || fail "the silent pass did not take its ten tries"
 echo "prometheus test: scene 3, the controller silent: notified after $silent_time s"
 
 # One notification an alert, none repeated, no other alert fired.

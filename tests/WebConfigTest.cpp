@@ -72,7 +72,7 @@ TEST_F(WebConfigFile, MistakesAreRefusedWithTheirReason) {
 }
 
 TEST(BasicAuth, OnlyAUserWithTheRightPasswordIsLetIn) {
-    Tool::BasicAuth auth({{"prometheus", kHash}});
+    Tool::BasicAuth auth(std::map<std::string, std::string>{{"prometheus", kHash}});
     const struct {
         const char* header;
         bool allowed;
@@ -86,7 +86,7 @@ TEST(BasicAuth, OnlyAUserWithTheRightPasswordIsLetIn) {
         {"", false},
     };
     for (const auto& c : cases) EXPECT_EQ(auth.allows(c.header), c.allowed) << c.header;
-    EXPECT_TRUE(Tool::BasicAuth({}).allows(""));
+    EXPECT_TRUE(Tool::BasicAuth(std::map<std::string, std::string>()).allows(""));
 }
 
 }  // namespace
