@@ -20,6 +20,8 @@ command -v pkg-config >/dev/null || need+=(pkg-config)
 [ -f /usr/include/yaml-cpp/yaml.h ] || need+=(libyaml-cpp-dev)
 [ -f /usr/include/crypt.h ] || need+=(libcrypt-dev)
 command -v curl >/dev/null || need+=(curl)
+# The API reference and its check that every public declaration is documented.
+command -v doxygen >/dev/null || need+=(doxygen)
 # libFuzzer targets: clang and its sanitizer/fuzzer runtime, where the
 # distribution has them (the test script skips fuzzing without them).
 optional=()

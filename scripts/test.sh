@@ -7,6 +7,12 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/install-deps.sh
 
+# libFuzzer's findings belong in build-fuzz/artifacts/, never in the tree.
+if git ls-files 2>/dev/null | grep -E '(^|/)(crash|leak|oom|slow-unit|timeout)-[0-9a-f]{40}$'; then
+  echo "libFuzzer artifacts are tracked in the tree (above): remove them"
+  exit 1
+fi
+
 jobs=$(nproc)
 build() {
   local dir=$1
@@ -21,6 +27,9 @@ echo "== plain build"
 build build -DTAV_IPMI_BUILD_TESTS=ON -DTAV_IPMI_BUILD_BENCH=ON -DTAV_IPMI_BUILD_TOOL=ON \
   -DTAV_IPMI_BUILD_VM_TESTS=ON -DTAV_IPMI_SANITIZE=
 ctest --test-dir build --output-on-failure -j"$jobs"
+
+echo "== API reference: every public declaration documented"
+scripts/docs-check.sh
 
 echo "== install"
 scripts/install-test.sh build

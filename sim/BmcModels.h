@@ -76,6 +76,10 @@ struct SelModel {
     uint16_t lastProcessedByBmc = 0xFFFF;
     // Log a "log area reset/cleared" event after an erase, as many controllers do.
     bool logsClearEvent = false;
+    // A full log overwrites its oldest record, the erase stamp unchanged.
+    bool circular = false;
+    // Nonzero: the SEL clock stands at this value (tests move it by hand).
+    uint32_t frozenClock = 0;
 };
 
 struct LanChannelModel {

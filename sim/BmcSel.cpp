@@ -211,6 +211,7 @@ Response getLastProcessedEventId(Bmc& b, const Request& r) {
 }  // namespace
 
 uint32_t selClock(const Bmc& bmc) {
+    if (bmc.sel.frozenClock != 0) return bmc.sel.frozenClock;
     return static_cast<uint32_t>(static_cast<int64_t>(time(nullptr)) + bmc.sel.clockOffset);
 }
 
@@ -218,7 +219,8 @@ uint16_t addSelRecord(Bmc& bmc, const uint8_t record[16], bool keepTimestamp) {
     SelModel& sel = bmc.sel;
     if (sel.records.size() >= capacity(sel)) {
         sel.overflow = true;
-        return 0;
+        if (!sel.circular || sel.records.empty()) return 0;
+        sel.records.erase(sel.records.begin());
     }
     std::vector<uint8_t> r(record, record + kRecordBytes);
     uint16_t id = sel.nextRecordId;

@@ -175,6 +175,15 @@ int ioctl(int fd, unsigned long request, ...) noexcept {
 
 int poll(struct pollfd* fds, nfds_t nfds, int timeout) {
     if (nfds > 0 && fds != nullptr) {
+        int errors = 0;
+        for (nfds_t i = 0; i < nfds; ++i) {
+            fds[i].revents = sim().reportsPollError(fds[i].fd) ? POLLERR : 0;
+            errors += fds[i].revents != 0;
+        }
+        if (errors > 0) {
+            sim().countPollError();
+            return errors;
+        }
         std::vector<int> list;
         for (nfds_t i = 0; i < nfds; ++i) list.push_back(fds[i].fd);
         if (sim().waitTimesOutVirtually(list.data(), list.size())) {

@@ -13,6 +13,9 @@
 // the controller answered ("netfn cmd count" lines, hexadecimal netfn and
 // cmd), then "total N". A program can read the total between its own
 // operations through tavIpmiSimTotalExchanges (dlsym(RTLD_DEFAULT, ...)).
+// TAV_IPMI_SIM_SEL_FILE=FILE keeps the controller's SEL in FILE (16-byte
+// records): read at start when present, written after every event the program
+// logs, so the log outlives the program as a real controller's does.
 // TAV_IPMI_SIM_CONTROL=1 lets a test steer a running program's simulator by
 // signals: SIGUSR1 adds an event to the SEL, SIGUSR2 prints the exchanges so
 // far per command on stderr, SIGRTMIN takes the inlet temperature past its
@@ -31,6 +34,7 @@
 #include <unistd.h>
 
 #include <exception>
+#include <fstream>
 
 #include "Bmc.h"
 #include "Sim.h"
@@ -38,12 +42,33 @@
 // Tells the interposer that it lives in the preload library.
 extern "C" const int tavIpmiSimPreloaded = 1;
 
+namespace {
+
+// Writes the log whole under another name and renames it, so a program
+// killed meanwhile leaves the last complete log.
+void keepSel(const Sim::Bmc& b) {
+    const char* path = getenv("TAV_IPMI_SIM_SEL_FILE");
+    if (path == nullptr || *path == '\0') return;
+    const std::string temporary = std::string(path) + ".tmp";
+    {
+        std::ofstream out(temporary, std::ios::binary | std::ios::trunc);
+        for (const auto& r : b.sel.records) out.write(reinterpret_cast<const char*>(r.data()), long(r.size()));
+        if (!out) return;
+    }
+    rename(temporary.c_str(), path);
+}
+
+}  // namespace
+
 // Lets a program running on the simulator (the tool's watch demo) log a SEL
 // record as the controller's own sensors would. Returns the record ID, 0 when
 // the log is full or no controller is installed.
 extern "C" __attribute__((visibility("default"))) int tavIpmiSimAddSelEvent(const unsigned char* record) {
     int id = 0;
-    Sim::Simulator::instance().withBmc([&](Sim::Bmc& b) { id = Sim::addSelRecord(b, record); });
+    Sim::Simulator::instance().withBmc([&](Sim::Bmc& b) {
+        id = Sim::addSelRecord(b, record);
+        keepSel(b);
+    });
     return id;
 }
 
@@ -105,8 +130,16 @@ void* controlThread(void* arg) {
     for (;;) {
         int sig = 0;
         if (sigwait(signals, &sig) != 0) continue;
-        if (sig == SIGUSR1) Sim::Simulator::instance().withBmc(addSelEvent);
-        if (sig == SIGRTMIN) Sim::Simulator::instance().withBmc(crossUpperCritical);
+        if (sig == SIGUSR1)
+            Sim::Simulator::instance().withBmc([](Sim::Bmc& b) {
+                addSelEvent(b);
+                keepSel(b);
+            });
+        if (sig == SIGRTMIN)
+            Sim::Simulator::instance().withBmc([](Sim::Bmc& b) {
+                crossUpperCritical(b);
+                keepSel(b);
+            });
         if (sig == SIGRTMIN + 1) silence(true);
         if (sig == SIGRTMIN + 2) silence(false);
         if (sig == SIGUSR2) {
@@ -158,6 +191,12 @@ __attribute__((constructor)) void installFromEnvironment() {
         const char* vt = getenv("TAV_IPMI_SIM_VIRTUAL_TIME");
         auto bmc = Sim::loadProfile(path);
         if (fruImage) Sim::loadFruImage(*bmc, 0, name);
+        const char* selFile = getenv("TAV_IPMI_SIM_SEL_FILE");
+        if (selFile != nullptr && access(selFile, R_OK) == 0) {
+            bmc->sel.records.clear();
+            bmc->sel.nextRecordId = 1;
+            Sim::loadSelDump(*bmc, selFile);
+        }
         Sim::Simulator::instance().install(bmc, vt != nullptr && strcmp(vt, "1") == 0);
     } catch (const std::exception& e) {
         // Without its controller the program would reach for the real

@@ -41,7 +41,8 @@ enum class FaultKind {
     AsyncEventFirst,  // an asynchronous event message is queued before the answer
     SendError,        // IPMICTL_SEND_COMMAND fails with errno `error`
     ReceiveError,     // IPMICTL_RECEIVE_MSG(_TRUNC) fails with errno `error`
-    DuplicateAnswer   // the answer is queued twice: the copy is stale for the next request
+    DuplicateAnswer,  // the answer is queued twice: the copy is stale for the next request
+    PollError         // no answer; a wait on the descriptor reports POLLERR without POLLIN
 };
 
 struct Fault {
@@ -121,6 +122,7 @@ struct DeviceHandle {
     unsigned int retryTimeMs = 0;
     bool awaitingNothing = false;  // the last request will never be answered
     bool hang = false;             // ... and the wait runs in real time
+    bool pollError = false;        // a wait reports POLLERR until the next request
 };
 
 class Simulator {
@@ -161,6 +163,11 @@ public:
     int ioctlDevice(int fd, unsigned long request, void* arg);
     // True when a wait on these descriptors should time out at once in virtual time.
     bool waitTimesOutVirtually(const int* fds, size_t count) const;
+    // True when the device behind `fd` reports an error to a wait.
+    bool reportsPollError(int fd) const;
+    // Waits on a device descriptor that reported an error (PollError).
+    unsigned pollErrorsReported() const { return pollErrors_.load(); }
+    void countPollError() { pollErrors_.fetch_add(1); }
 
     // Answers one request: faults first, then the controller.
     Response exchange(const Request& req, Fault* applied);
@@ -185,6 +192,7 @@ private:
     VirtualClock clock_;
     std::atomic<int> openError_{0};
     std::atomic<int64_t> latencyUs_{0};
+    std::atomic<unsigned> pollErrors_{0};
 };
 
 // Real C-library functions, past the interposer (and past sanitizer interceptors).

@@ -294,6 +294,8 @@ int Simulator::sendCommand(DeviceHandle& h, void* arg) {
     Response answer = exchange(r, &applied);
     h.awaitingNothing = false;
     h.hang = false;
+    h.pollError = applied.times != 0 && applied.kind == FaultKind::PollError;
+    if (h.pollError) return 0;
     if (applied.times != 0 && (applied.kind == FaultKind::NoAnswer || applied.kind == FaultKind::Hang)) {
         h.awaitingNothing = true;
         h.hang = applied.kind == FaultKind::Hang;
@@ -390,6 +392,12 @@ bool Simulator::waitTimesOutVirtually(const int* fds, size_t count) const {
             return true;
     }
     return false;
+}
+
+bool Simulator::reportsPollError(int fd) const {
+    std::lock_guard<std::mutex> guard(mutex_);
+    auto it = handles_.find(fd);
+    return it != handles_.end() && it->second.pollError && it->second.queue.empty();
 }
 
 }  // namespace Sim

@@ -86,6 +86,11 @@ TEST_F(Fru, ReadFruDataShrinksRetriesAndGivesUp) {
                       }); },
          kFailed, 23, 0,
          {"IpmiIfcReadFru: Response payload larger than expected (corrupt?) datalen: 0x1a, data[1]: 0x18 > 0x17"}},
+        {"an answer shorter than its own count fails the read",
+         [](Sim::Bmc& b) { b.on(st, cmd::readFruData, [](Sim::Bmc&, const Sim::Request&) {
+                          return Sim::Response{0, 5, 1, 2};
+                      }); },
+         kFailed, 23, 0, {"IpmiIfcReadFru: Response shorter than its count (corrupt?) datalen: 0x4, data[1]: 0x5"}},
         {"answers without data end the read",
          [](Sim::Bmc& b) { b.on(st, cmd::readFruData, [](Sim::Bmc&, const Sim::Request&) {
                           return Sim::Response{0, 0};
@@ -121,6 +126,19 @@ TEST_F(Fru, AMultiRecordChainWithoutEndStopsAtTheInventoryEnd) {
     EXPECT_EQ(IpmiIfcFruMultiLength(0, 1, 8), 56u);
     EXPECT_EQ(sim().exchanges(st, cmd::readFruData), 7u);
     EXPECT_TRUE(log.contains(LOG_INFO, "IpmiIfcFruMultiLength: no end of list before offset 0x40"));
+}
+
+TEST_F(Fru, AChainOfTinyRecordsEndsAfterABoundedNumber) {
+    image.assign(8 + 6 * 300, 0);
+    for (size_t at = 8; at + 6 <= image.size(); at += 6) {
+        const Bytes record{0xC0, 0x02, 1, 0xFF, static_cast<uint8_t>(0x100 - 0xC3), 1};
+        std::copy(record.begin(), record.end(), image.begin() + static_cast<long>(at));
+    }
+    bmc().fru.devices[1].data = image;
+    node().fruState.area_info[1] = static_cast<uint8_t>(image.size() & 0xFF);
+    node().fruState.area_info[2] = static_cast<uint8_t>(image.size() >> 8);
+    EXPECT_EQ(IpmiIfcFruMultiLength(0, 1, 8), 255u * 6);
+    EXPECT_EQ(sim().exchanges(st, cmd::readFruData), 255u);
 }
 
 TEST_F(Fru, WordAccessAsksForWords) {
@@ -277,6 +295,50 @@ TEST_F(Fru, DiscoveryBuildsOneFruPerAnsweringDevice) {
     EXPECT_EQ(largest, 23u);
     EXPECT_TRUE(log.contains(LOG_WARNING, "IpmiIfcFruInstantiateAll: FRU 0x0 board area checksum invalid"));
     EXPECT_EQ(before->getBoard()->getName(), "PWR SPLY,550W,RDNT");  // what a caller holds stays whole
+}
+
+// What fails on the way (busy, time-out, no answer) says nothing of a
+// device: it keeps the objects of the last pass, the whole device or the
+// areas not reached. The locator's instance byte loses its bit 7.
+TEST_F(Fru, AnUnreachableDeviceKeepsItsLastInventory) {
+    auto server = Sim::loadProfile(Sim::defaultProfilePath());
+    for (auto& r : server->sdr.records)
+        if (r.size() > fru::locator::entityInstance && r[3] == sdr::type::fruDeviceLocator &&
+            r[fru::locator::deviceId] == 1)
+            r[fru::locator::entityInstance] |= 0x80;
+    useBmc(server);
+    ASSERT_EQ(IpmiIfcSdrGetInfo(0), 0u);
+    ASSERT_EQ(IpmiIfcFruInstantiateAll(0), 0);
+    ASSERT_EQ(IpmiIfc::getFrus(0).size(), 2u);
+    EXPECT_EQ(IpmiIfc::getFrus(0)[1]->getEntity(), IpmiEntity(10, 1, 0, 0));
+    const struct {
+        const char* what;
+        std::function<void()> fault;
+        bool device0Same, device1AreasSame;
+    } scenes[] = {
+        {"Get FRU Inventory Area Info busy", [] { faults().addFault(st, cmd::getFruInventoryAreaInfo, Fault::completionCode(cc::nodeBusy)); }, true, false},
+        {"no answer to the common header", [] { faults().addFault(st, cmd::readFruData, Fault::of(FaultKind::NoAnswer)); }, true, false},
+        {"time-outs once device 1's header is read",
+         [] {
+             faults().addFault(st, cmd::readFruData, passThrough(15));
+             faults().addFault(st, cmd::readFruData, Fault::completionCode(cc::timeout, -1));
+         },
+         false, true},
+    };
+    for (const auto& s : scenes) {
+        SCOPED_TRACE(s.what);
+        faults().clearFaults();
+        const auto before = IpmiIfc::getFrus(0);
+        s.fault();
+        ASSERT_EQ(IpmiIfcFruInstantiateAll(0), 0);
+        const auto now = IpmiIfc::getFrus(0);
+        ASSERT_EQ(now.size(), 2u);
+        EXPECT_EQ(now[0] == before[0], s.device0Same);
+        if (s.device1AreasSame) {
+            EXPECT_NE(now[1], before[1]);
+            EXPECT_EQ(now[1]->getOptionalRefArray(), before[1]->getOptionalRefArray());
+        }
+    }
 }
 
 TEST_F(Fru, ReadersNeverSeeAHalfBuiltList) {

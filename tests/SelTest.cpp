@@ -5,6 +5,7 @@
 #include <stdlib.h>
 #include <string.h>
 
+#include <algorithm>
 #include <atomic>
 #include <mutex>
 #include <random>
@@ -92,7 +93,11 @@ TEST(SelRecord, SummaryOfTheLog) {
 // ---- A controller's SEL followed through Get SEL Info ----------------------
 
 class SelFollow : public TestSupport::SimTest {
-protected:
+public:
+    using SimTest::bmc;
+    using SimTest::sim;
+    using SimTest::useBmc;
+
     // Logs an event as a sensor would, stamped by the controller's clock;
     // `serial` makes it unique. Returns its bytes as stored, or empty when full.
     Bytes logEvent(uint16_t serial) {
@@ -280,9 +285,22 @@ TEST_F(SelFollow, UnregisterWaitsForTheRunningCall) {
     EXPECT_TRUE(sawFinished.load());
 }
 
-// Controllers that answer badly: every read ends within its bounds (four
-// attempts a chunk, one request per record the log claims, plus one) and no
-// record is held twice.
+// Every ID names a record, and every record has a next one.
+Sim::Response endlessChain(Sim::Bmc&, const Sim::Request& r) {
+    const uint16_t id = sel::le16(r.data.data() + sel::entryRequest::recordId);
+    const uint16_t own = id == 0 ? 1 : id;
+    Sim::Response out{cc::ok, uint8_t(own + 1), uint8_t((own + 1) >> 8)};
+    sel_event_record e = eventRecord(0x01, 0x01, 0x07);
+    sel::putLe16(e.record_id, own);
+    const Bytes bytes = bytesOf(e);
+    out.insert(out.end(), bytes.begin(), bytes.end());
+    return out;
+}
+
+// Controllers that answer badly: every pass ends within its bounds (four
+// attempts a chunk and a retry budget for the whole pass, one request per
+// record the log claims plus one, at most 4,096 records) and no record is
+// held twice; the reload never asks Get SEL Info again from within itself.
 TEST_F(SelFollow, HostileAnswersEndWithinBounds) {
     for (uint16_t i = 1; i <= 5; ++i) logEvent(i);
     auto fault = [this](const Sim::Fault& f) { sim().addFault(netfn::storage, cmd::getSelEntry, f); };
@@ -297,7 +315,25 @@ TEST_F(SelFollow, HostileAnswersEndWithinBounds) {
         {"answers cut short", [&] { fault(Sim::Fault::answerLength(Sim::FaultKind::CutAnswer, 12, -1)); }, 0, 4 * 6},
         {"answers too long", [&] { fault(Sim::Fault::answerLength(Sim::FaultKind::LongAnswer, 30, -1)); }, 0, 4 * 6},
         {"reservation always cancelled", [&] { fault(Sim::Fault::completionCode(cc::reservationCancelled, -1)); }, 0,
-         4 * 6},
+         24},
+        {"busy for ever", [&] { fault(Sim::Fault::completionCode(cc::nodeBusy, -1)); }, 0, 24},
+        {"next IDs that never end, 0xFFFF entries claimed",
+         [this] {
+             bmc().on(netfn::storage, cmd::getSelEntry, endlessChain);
+             bend(false, true);
+         },
+         4096, 4097},
+        {"version 0, erased at every answer",
+         [this] {
+             auto standard = std::make_shared<Sim::Bmc>();
+             bmc().sel.version = 0;
+             bmc().on(netfn::storage, cmd::getSelInfo, [standard](Sim::Bmc& b, const Sim::Request& r) {
+                 b.sel.eraseTimestamp += 1;
+                 standard->sel = b.sel;
+                 return standard->handle(r);
+             });
+         },
+         0, 0},
     };
     for (uint32_t erase : {0u, 1000u}) {  // the first read: incremental from record 0, or a reload
         for (const auto& s : scenes) {
@@ -305,7 +341,10 @@ TEST_F(SelFollow, HostileAnswersEndWithinBounds) {
             InitIpmiNode(0);
             sim().clearFaults();
             Sim::registerSelHandlers(bmc());
-            sim().withBmc([&](Sim::Bmc& b) { b.sel.eraseTimestamp = erase; });
+            sim().withBmc([&](Sim::Bmc& b) {
+                b.sel.eraseTimestamp = erase;
+                b.sel.version = sel::supportedVersion;
+            });
             s.spoil();
             sim().resetCounters();
             EXPECT_EQ(IpmiIfcSelGetInfo(0, nullptr), 0u);
@@ -313,9 +352,13 @@ TEST_F(SelFollow, HostileAnswersEndWithinBounds) {
             EXPECT_LE(entryReads(), s.maxEntryReads);
         }
     }
+    // Command-line mode reloads at every call: version 0 ends there too.
+    ASSERT_EQ(IpmiIfcInitForCLI(0), 0);
+    EXPECT_EQ(IpmiIfcSelGetInfo(0, nullptr), 0u);
+    IpmiIfcCloseForCLI(0);
 }
 
-// The Parts' smaller promises, one scene: an empty log and a bad version
+// The smaller promises, one scene: an empty log and a bad version
 // fail the reload (the version message once per process); a clear whose
 // erasure is still in progress succeeds; the last-processed ID and the
 // clock go to the controller; the property line names the cached sensor.
@@ -351,6 +394,174 @@ TEST_F(SelFollow, ControllerOperations) {
     EXPECT_EQ(IpmiIfcSelGetInfo(0, nullptr), 0u);
     EXPECT_EQ(log.count("IpmiIfcSelGetAll: invalid version. Version = 0x1"), 1u);
     EXPECT_EQ(heldRecords(), 0u);
+}
+
+// ---- Over time: clocks, storms, wrapping logs, handlers that misbehave -------
+
+// A scene starts with a log of three records found at start, then logs
+// events and runs passes; whatever happens, a recording handler gets every
+// record logged after start once, in log order. The SEL clock stands still
+// unless a scene moves it, so events share seconds as in a storm.
+class SelOverTime : public SelFollow {
+public:
+    void begin(std::function<void(Sim::Bmc&)> setUp = nullptr) {
+        IpmiIfcSelCleanUpEventHandlers(0);
+        useBmc(std::make_shared<Sim::Bmc>());
+        sim().clearFaults();
+        InitIpmiNode(0);
+        logged.clear();
+        got.records.clear();
+        sim().withBmc([&](Sim::Bmc& b) {
+            b.sel.frozenClock = 0x60000000;
+            if (setUp) setUp(b);
+        });
+        for (uint16_t i = 0; i < 3; ++i) logEvent(0xF000 + i);
+        pass();
+        IpmiIfc::registerSelEventHandler(recordIt, &got);
+    }
+    void pass() { IpmiIfcSelGetInfo(0, nullptr); }
+    void tick(int64_t seconds = 1) {
+        sim().withBmc([&](Sim::Bmc& b) { b.sel.frozenClock = uint32_t(int64_t(b.sel.frozenClock) + seconds); });
+    }
+    void event() {
+        Bytes stored = logEvent(++serial);
+        ASSERT_FALSE(stored.empty());
+        logged.push_back(stored);
+    }
+    // The records logged as the controller stores them, found by ID.
+    void loggedByController(Sim::Bmc& b) { logged.push_back(b.sel.records.back()); }
+
+    std::vector<Bytes> logged;
+    Received got;
+    uint16_t serial = 0;
+};
+
+int clearedOnce = 0;
+void clearing(void*, IpmiSelData* record) {
+    if (record != nullptr && clearedOnce++ == 0) IpmiIfc::clearSel();
+}
+void throwing(void*, IpmiSelData* record) {
+    if (record != nullptr) throw std::runtime_error("handler failed");
+}
+
+TEST_F(SelOverTime, EveryRecordLoggedAfterStartReachesTheHandlersOnce) {
+    const struct {
+        const char* what;
+        std::function<void(SelOverTime&)> run;
+    } scenes[] = {
+        {"events within the second of the last answer",
+         [](SelOverTime& t) {
+             t.event(), t.pass(), t.event(), t.pass(), t.event(), t.event(), t.pass();
+         }},
+        {"an event logged while a pass reads, a second later",
+         [](SelOverTime& t) {
+             bool once = false;
+             auto standard = std::make_shared<Sim::Bmc>();
+             t.bmc().on(netfn::storage, cmd::getSelEntry, [&, standard](Sim::Bmc& b, const Sim::Request& r) {
+                 standard->sel = b.sel;
+                 Sim::Response out = standard->handle(r);
+                 if (!once) {
+                     once = true;
+                     b.sel.frozenClock += 1;
+                     sel_event_record e = eventRecord(0x01, 0x01, 0x07, 0x55, 0x55);
+                     Sim::addSelRecord(b, reinterpret_cast<uint8_t*>(&e));
+                     t.loggedByController(b);
+                 }
+                 return out;
+             });
+             t.tick(), t.event(), t.pass();
+             Sim::registerSelHandlers(t.bmc());
+             t.pass(), t.tick(), t.event(), t.pass();
+         }},
+        {"the clock set back an hour",
+         [](SelOverTime& t) {
+             t.tick(5), t.event(), t.pass();
+             t.tick(-3600);
+             for (int i = 0; i < 3; ++i) t.tick(), t.event(), t.pass();
+         }},
+        {"a full log that overwrites its oldest records, the last read among them",
+         [](SelOverTime& t) {
+             // Four records fit: four events a pass overwrite the last one read.
+             t.bmc().sel.allocationUnits = 4;
+             t.bmc().sel.circular = true;
+             for (int p = 0; p < 3; ++p) {
+                 for (int i = 0; i < 4; ++i) t.tick(), t.event();
+                 t.pass();
+             }
+         }},
+        {"a read that fails mid-pass",
+         [](SelOverTime& t) {
+             for (int i = 0; i < 3; ++i) t.tick(), t.event();
+             // The first read (the record last held) and the next pass; the four after it are busy.
+             Sim::Bmc& b = t.bmc();
+             int reads = 0;
+             auto standard = std::make_shared<Sim::Bmc>();
+             b.on(netfn::storage, cmd::getSelEntry, [&reads, standard](Sim::Bmc& m, const Sim::Request& r) {
+                 standard->sel = m.sel;
+                 return ++reads >= 3 && reads <= 6 ? Sim::Response{cc::nodeBusy} : standard->handle(r);
+             });
+             t.pass();
+             Sim::registerSelHandlers(b);
+             t.pass(), t.pass(), t.tick(), t.event(), t.pass();
+         }},
+        {"a handler that clears the log",
+         [](SelOverTime& t) {
+             t.bmc().sel.logsClearEvent = true;
+             clearedOnce = 0;
+             IpmiIfc::registerSelEventHandler(clearing, nullptr);
+             for (int i = 0; i < 4; ++i) t.tick(), t.event();
+             t.pass();
+             t.sim().withBmc([&](Sim::Bmc& b) { t.logged.push_back(b.sel.records.front()); });
+             t.pass(), t.tick(), t.event(), t.pass();
+         }},
+        {"a handler that throws",
+         [](SelOverTime& t) {
+             IpmiIfc::registerSelEventHandler(throwing, nullptr);
+             for (int i = 0; i < 4; ++i) t.tick(), t.event();
+             t.pass(), t.tick(), t.event(), t.pass();
+         }},
+    };
+    for (const auto& s : scenes) {
+        SCOPED_TRACE(s.what);
+        begin();
+        s.run(*this);
+        EXPECT_EQ(got.records, logged);
+        IpmiIfc::unRegisterSelEventHandler(clearing);
+        IpmiIfc::unRegisterSelEventHandler(throwing);
+    }
+}
+
+// A caller that restarts hands the library the last record it received:
+// the first pass delivers what followed it, once a handler is there; a
+// cursor whose record is gone falls back to its time stamp.
+TEST_F(SelOverTime, DeliveryResumesAfterTheCursor) {
+    for (bool cleared : {false, true}) {
+        SCOPED_TRACE(cleared ? "cursor record cleared" : "cursor record present");
+        begin();
+        for (int i = 0; i < 3; ++i) tick(), event();
+        pass();
+        ASSERT_EQ(got.records.size(), 3u);
+        const auto held = IpmiIfc::getSelData();
+        const IpmiSelCursor cursor = IpmiSelCursor::at(*held[held.size() - 2]);  // the second new record
+        IpmiIfcSelCleanUpEventHandlers(0);
+        InitIpmiNode(0);  // the caller restarts
+        std::vector<Bytes> missed(logged.end() - 1, logged.end());
+        if (cleared) {
+            sim().withBmc([](Sim::Bmc& b) { Sim::clearSelRecords(b); });
+            missed.clear();
+        }
+        for (int i = 0; i < 2; ++i) {
+            tick(), event();
+            missed.push_back(logged.back());
+        }
+        IpmiIfc::resumeSelDelivery(0, cursor);
+        got.records.clear();
+        pass();  // no handler yet: the records wait
+        IpmiIfc::registerSelEventHandler(recordIt, &got);
+        pass(), tick(), event(), pass();
+        missed.push_back(logged.back());
+        EXPECT_EQ(got.records, missed);
+    }
 }
 
 // ---- Direct synchroniser ---------------------------------------------------
@@ -407,6 +618,52 @@ TEST_F(SelSync, ReportsWhatWasAddedSinceTheLastCall) {
     sim().resetCounters();
     EXPECT_TRUE(sync().empty());
     EXPECT_EQ(entryReads(), 3u);
+}
+
+
+// The synchroniser's own transport and bounds: a device that reports an
+// error ends the wait; a refused reservation fails the call and keeps the
+// state; a log that claims without end, or answers only with completion
+// codes, costs a bounded number of exchanges a call.
+TEST_F(SelSync, FailsAndEndsWithinBounds) {
+    for (uint16_t i = 1; i <= 3; ++i) logEvent(i);
+    sim().addFault(netfn::storage, cmd::getSelInfo, Sim::Fault::of(Sim::FaultKind::PollError));
+    EXPECT_TRUE(sync(false).empty());
+    EXPECT_EQ(sim().pollErrorsReported(), 1u);
+    const auto lines = log.lines();
+    EXPECT_EQ(std::count_if(lines.begin(), lines.end(),
+                            [](const TestSupport::LogLine& l) {
+                                return l.text.rfind("recv_reply: poll(", 0) == 0 &&
+                                       l.text.find(") reports a device error (revents 0x8)") != std::string::npos;
+                            }),
+              1);
+
+    sim().addFault(netfn::storage, cmd::reserveSel, Sim::Fault::completionCode(cc::invalidCommand));
+    sim().resetCounters();
+    EXPECT_TRUE(sync(false).empty());
+    EXPECT_EQ(entryReads(), 0u);
+    EXPECT_EQ(state.lastRecordId, 0);
+    EXPECT_EQ(sync(), (std::vector<uint16_t>{1, 2, 3}));
+
+    bend(false, true);  // 0xFFFF entries
+    const struct {
+        const char* what;
+        std::function<void()> spoil;
+        unsigned maxEntryReads;
+    } scenes[] = {
+        {"only completion codes", [this] { sim().addFault(netfn::storage, cmd::getSelEntry, Sim::Fault::completionCode(cc::unspecifiedError, -1)); }, 16},
+        {"next IDs that never end", [this] { bmc().on(netfn::storage, cmd::getSelEntry, endlessChain); }, 4096},
+    };
+    for (const auto& s : scenes) {
+        SCOPED_TRACE(s.what);
+        sim().clearFaults();
+        s.spoil();
+        later();
+        logEvent(9);
+        sim().resetCounters();
+        sync();
+        EXPECT_LE(entryReads(), s.maxEntryReads);
+    }
 }
 
 }  // namespace

@@ -3,6 +3,7 @@
 // re-executes it with that library in front of any sanitizer runtime.
 
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <stdlib.h>
 #include <unistd.h>
 
@@ -26,6 +27,64 @@ ToolRun tavipmi(const std::vector<std::string>& args, const std::string& profile
 }
 
 std::string defaultProfile() { return TestSupport::readFile(std::string(TAV_IPMI_SOURCE_DIR) + "/sim/profiles/default.emu"); }
+
+// The record IDs a JSON watch printed, in order.
+std::vector<unsigned> watched(const std::string& out) {
+    std::vector<unsigned> ids;
+    std::istringstream in(out);
+    for (std::string line; std::getline(in, line);)
+        if (!line.empty() && line[0] == '{') ids.push_back(Json::parse(line).at("record_id").get<unsigned>());
+    return ids;
+}
+
+// watch keeps where delivery stands: killed while events arrive and started
+// again, it hands over the records logged meanwhile once, then goes on; a
+// damaged state file starts afresh with one warning.
+TEST(Tool, WatchResumesAfterAKillWithNothingLostOrRepeated) {
+    char dir[] = "/tmp/tav-watch-XXXXXX";
+    ASSERT_NE(mkdtemp(dir), nullptr);
+    const std::string sel = std::string(dir) + "/sel", state = std::string(dir) + "/state";
+    const std::vector<std::string> env{"TAV_IPMI_SIM_SEL_FILE=" + sel};
+    auto watch = [&](std::vector<std::string> more, unsigned seconds) {
+        std::vector<std::string> args{"--format", "json", "watch", "--demo", "--state", state};
+        args.insert(args.end(), more.begin(), more.end());
+        return TestSupport::runTool("default", TAV_IPMI_TOOL, args, env, seconds);
+    };
+    const ToolRun first = watch({}, 4);  // killed by the alarm after about three records
+    EXPECT_EQ(first.exitCode, 128 + SIGALRM);
+    EXPECT_NE(first.err.find("tavipmi: no SEL delivery state in " + state +
+                             " yet: delivering the records logged from now on"),
+              std::string::npos);
+    // While it is down the controller logs two more events.
+    std::string log = TestSupport::readFile(sel);
+    ASSERT_GE(log.size(), 16u * 9);
+    for (int i = 0; i < 2; ++i) {
+        std::string record = log.substr(log.size() - 16);
+        const unsigned id = uint8_t(record[0]) + 1u;
+        record[0] = char(id & 0xFF), record[1] = char(id >> 8), record[15] = char(0x40 + i);
+        log += record;
+    }
+    { std::ofstream(sel, std::ios::binary | std::ios::trunc) << log; }
+    const ToolRun second = watch({"--count", "4"}, 30);
+    EXPECT_EQ(second.exitCode, 0) << second.err;
+    std::vector<unsigned> printed = watched(first.out), more = watched(second.out);
+    printed.insert(printed.end(), more.begin(), more.end());
+    std::vector<unsigned> logged;  // after the eight records the profile starts with
+    log = TestSupport::readFile(sel);
+    for (size_t at = 16 * 8; at + 16 <= log.size() && logged.size() < printed.size(); at += 16)
+        logged.push_back(uint8_t(log[at]) | uint8_t(log[at + 1]) << 8);
+    EXPECT_GE(watched(first.out).size(), 2u);
+    EXPECT_EQ(printed, logged);
+
+    { std::ofstream(state) << "{\"format\": 1, \"record_id\": "; }
+    const ToolRun damaged = watch({"--count", "1"}, 30);
+    EXPECT_NE(damaged.err.find("tavipmi: SEL delivery state in " + state +
+                               " is damaged (not JSON): delivering the records logged from now on"),
+              std::string::npos)
+        << damaged.err;
+    for (const std::string& f : {sel, state}) remove(f.c_str());
+    rmdir(dir);
+}
 
 TEST(Tool, ViewsShowTheSimulatedServer) {
     const struct {

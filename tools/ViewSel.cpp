@@ -17,6 +17,7 @@
 #include "IpmiSel.h"
 #include "IpmiSelData.h"
 #include "IpmiSensor.h"
+#include "SelCursorFile.h"
 #include "SelFacts.h"
 #include "Views.h"
 
@@ -78,19 +79,23 @@ struct Watch {
     std::atomic<int> printed{0};
     int limit = 0;  // 0: until interrupted
     bool demo = false;
+    Tool::SelCursorFile state;
 };
 Watch watch;
 
 void watchOptions(CLI::App& sub) {
     sub.add_flag("--demo", watch.demo, "on the simulated BMC, log an event a second");
     sub.add_option("--count", watch.limit, "end after N records")->check(CLI::NonNegativeNumber);
+    watch.state.addOption(sub, "watch.state");
 }
 
 void printNewRecord(void* context, Ipmi::IpmiSelData* record) {
     if (record == nullptr) return;  // the loop's periodic call
     auto* w = static_cast<Watch*>(context);
+    if (w->limit > 0 && w->printed >= w->limit) return;  // ending: the rest waits for the next run
     printRecord(Tool::selRecord(*record, Ipmi::IpmiIfc::getSensors(0)));
     fflush(stdout);
+    w->state.save(*record);
     ++w->printed;
 }
 
@@ -132,6 +137,7 @@ int watchSel(std::vector<Tool::Section>&) {
     fflush(stdout);
     // A pass a second: the loop's own period is counted in 16-second units.
     // start() clears the node record, handlers included: register once it runs.
+    w.state.resume();
     std::atomic<bool> loopEnded{false};
     std::thread waiter([&] {
         const struct timespec tick = {1, 0};

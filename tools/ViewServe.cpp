@@ -22,6 +22,7 @@
 #include "IpmiSelData.h"
 #include "LoopHealth.h"
 #include "Metrics.h"
+#include "SelCursorFile.h"
 #include "SelFacts.h"
 #include "Views.h"
 #include "WebConfig.h"
@@ -37,6 +38,7 @@ std::string webConfigFile;
 // the interval: the default age allows three such periods.
 constexpr int kSecondsPerReadingPeriod = 8 * 16;
 constexpr int kDefaultPeriods = 3;
+Tool::SelCursorFile selState;
 
 void serveOptions(CLI::App& sub) {
     sub.add_option("--listen", listen, "HOST:PORT to answer on (default 127.0.0.1:9623; port 0: any free port)");
@@ -49,6 +51,7 @@ void serveOptions(CLI::App& sub) {
     sub.add_option("--web.config.file", webConfigFile,
                    "Prometheus web configuration file: TLS certificate and key, client certificates, basic-auth "
                    "users with bcrypt hashes");
+    selState.addOption(sub, "serve.state");
 }
 
 bool splitListen(const std::string& text, std::string& host, int& port) {
@@ -79,7 +82,9 @@ void runLoop() {
 
 // Exactly once per record: the loop hands each new record over once.
 void countEvent(void*, Ipmi::IpmiSelData* record) {
-    if (record != nullptr) Tool::countSelEvent(*record);
+    if (record == nullptr) return;
+    Tool::countSelEvent(*record);
+    selState.save(*record);
 }
 
 int serve(std::vector<Tool::Section>&) {
@@ -141,6 +146,7 @@ int serve(std::vector<Tool::Section>&) {
     }
 
     Tool::loadHealthRules();
+    selState.resume();
     std::thread loop(runLoop);
     const int state =
         Ipmi::IpmiIfc::waitState(0, Ipmi::IpmiIfc::IPMI_STATE_RUNNING | Ipmi::IpmiIfc::IPMI_STATE_STOPPED);

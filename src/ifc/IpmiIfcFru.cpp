@@ -8,6 +8,7 @@
 
 #include <algorithm>
 #include <memory>
+#include <map>
 #include <set>
 #include <vector>
 
@@ -27,13 +28,34 @@ constexpr int kRetries = 4;
 // Answers of code 0 that carry no byte: a few in a row end the read, since
 // such a controller would otherwise be asked for ever.
 constexpr int kMaxEmptyAnswers = 3;
-// Records a multi-record chain may have: more than this many 5-byte headers
-// do not fit into the largest inventory area (64 KiB).
-constexpr unsigned kMaxMultiRecords = 0x10000 / fru::multi::headerLength;
+// Records a multi-record chain may have. Devices carry a handful; a chain
+// of tiny records without an end mark would otherwise cost one read each
+// up to the inventory's end.
+constexpr unsigned kMaxMultiRecords = 255;
+// What one discovery pass may spend: busy or time-out retries in all, and
+// Read FRU Data requests. The devices not reached keep their last objects
+// and are read first on the next pass.
+constexpr int kPassRetries = 16;
+constexpr int kPassReads = 4096;
 // The local controller's address as FRU device locator records write it.
 constexpr uint8_t kBmcAddress = 0x20;
 
 bool validNode(int node) { return node >= 0 && node < IPMI_NODE_COUNT; }
+
+struct PassBudget {
+    int retriesLeft = kPassRetries;
+    int readsLeft = kPassReads;
+};
+thread_local PassBudget* t_pass = nullptr;  // the discovery pass running on this thread
+
+bool passSpent() { return t_pass != nullptr && t_pass->readsLeft <= 0; }
+
+// A read that failed on the way (busy, time-out, no answer, or the pass's
+// budget spent) says nothing of the device: its last good object stays.
+bool unreachable(unsigned rc) { return rc == kFailed || rc == cc::nodeBusy || rc == cc::timeout; }
+
+// Where the next pass starts, per node: after the last device a spent pass read.
+size_t g_resumeAt[IPMI_NODE_COUNT];
 
 int maxRequest() { return __atomic_load_n(&fru_max_req_size, __ATOMIC_RELAXED); }
 
@@ -62,9 +84,10 @@ std::string locatorName(const fru::LocatorView& loc) {
     return toAsciiAndTrim(name);
 }
 
-// Reads `length` bytes at `offset` and checks their zero sum; empty on failure.
+// Reads `length` bytes at `offset`; empty on failure, and `lost` set when
+// the failure was the transport's.
 std::vector<uint8_t> readArea(int node, uint8_t id, uint8_t word, unsigned offset, unsigned length,
-                              unsigned areaSize, const char* what) {
+                              unsigned areaSize, const char* what, bool& lost) {
     if (length == 0) return {};
     if (offset + length > areaSize) {
         ipmiLog(LOG_WARNING, "IpmiIfcFruInstantiateAll: FRU 0x%x %s area at 0x%x runs past the inventory end (0x%x)",
@@ -77,6 +100,7 @@ std::vector<uint8_t> readArea(int node, uint8_t id, uint8_t word, unsigned offse
     if (rc != 0) {
         ipmiLog(LOG_WARNING, "IpmiIfcFruInstantiateAll: FRU 0x%x %s area at 0x%x not read (0x%x)", id, what, offset,
                 rc);
+        lost = unreachable(rc);
         return {};
     }
     return bytes;
@@ -87,9 +111,12 @@ bool zeroSum(std::vector<uint8_t>& bytes) {
     return IpmiIfcFruChecksum(bytes.data(), &sum, static_cast<unsigned>(bytes.size()));
 }
 
+unsigned infoAreaLength(int node, uint8_t id, uint8_t word, unsigned offset, unsigned& rc);
+unsigned multiLength(int node, uint8_t id, unsigned offset, unsigned& rc);
+
 template <class Area>
 std::shared_ptr<const IpmiFruOptional> readInfoArea(int node, uint8_t id, uint8_t word, uint8_t offsetUnits,
-                                                    unsigned areaSize, const char* what) {
+                                                    unsigned areaSize, const char* what, bool& lost) {
     if (offsetUnits == 0) return nullptr;
     const unsigned offset = offsetUnits * fru::kUnit;
     if (offset + fru::infoArea::headerLength > areaSize) {
@@ -97,8 +124,10 @@ std::shared_ptr<const IpmiFruOptional> readInfoArea(int node, uint8_t id, uint8_
                 id, what, offset, areaSize);
         return nullptr;
     }
-    std::vector<uint8_t> bytes =
-        readArea(node, id, word, offset, IpmiIfruInfoAreaLength(node, id, word, offset), areaSize, what);
+    unsigned rc = 0;
+    const unsigned length = infoAreaLength(node, id, word, offset, rc);
+    lost = unreachable(rc);
+    std::vector<uint8_t> bytes = readArea(node, id, word, offset, length, areaSize, what, lost);
     if (bytes.empty()) return nullptr;
     if (!zeroSum(bytes)) {
         ipmiLog(LOG_WARNING, "IpmiIfcFruInstantiateAll: FRU 0x%x %s area checksum invalid", id, what);
@@ -130,23 +159,32 @@ bool multiRecordsValid(const std::vector<uint8_t>& area, uint8_t id) {
 }
 
 std::shared_ptr<const IpmiFruOptional> readMultiArea(int node, uint8_t id, uint8_t word, uint8_t offsetUnits,
-                                                     unsigned areaSize) {
+                                                     unsigned areaSize, bool& lost) {
     if (offsetUnits == 0) return nullptr;
     const unsigned offset = offsetUnits * fru::kUnit;
-    std::vector<uint8_t> bytes =
-        readArea(node, id, word, offset, IpmiIfcFruMultiLength(node, id, offset), areaSize, "multi-record");
+    unsigned rc = 0;
+    const unsigned length = multiLength(node, id, offset, rc);
+    lost = unreachable(rc);
+    if (lost) return nullptr;  // a chain cut short would pass for a whole one
+    std::vector<uint8_t> bytes = readArea(node, id, word, offset, length, areaSize, "multi-record", lost);
     if (bytes.empty() || !multiRecordsValid(bytes, id)) return nullptr;
     return std::make_shared<const IpmiFruMulti>(static_cast<unsigned>(bytes.size()), bytes.data());
 }
 
-// One logical FRU device of the local controller; null when it does not answer
-// or its common header is not one this library reads.
-std::shared_ptr<IpmiFru> readDevice(int node, const fru::LocatorView& loc) {
+// One logical FRU device of the local controller; null when its common
+// header is not one this library reads. A device or an area that the
+// transport failed to reach keeps what `previous` (the last pass's object)
+// holds: one busy answer must not take a device out of the inventory.
+std::shared_ptr<IpmiFru> readDevice(int node, const fru::LocatorView& loc, const std::shared_ptr<IpmiFru>& previous) {
     IpmiNode& n = g_IpmiNode[node];
     uint8_t id = loc.deviceId();
     TAV::MutexLock guard(n.fruMutex);
+    if (passSpent()) return previous;
     RespHolder resp(IpmiIfcSendCmd(node, cmd::getFruInventoryAreaInfo, netfn::storage, 0, 1, &id, 0));
-    if (IpmiIfcRhFruInv(resp.get(), id) != 0) return nullptr;
+    if (IpmiIfcRhFruInv(resp.get(), id) != 0) {
+        const bool lost = !resp || resp->cc == cc::nodeBusy || resp->cc == cc::timeout;
+        return lost ? previous : nullptr;
+    }
     const unsigned areaSize = cachedAreaSize(n);
     const uint8_t word = cachedWordAccess(n);
 
@@ -161,7 +199,7 @@ std::shared_ptr<IpmiFru> readDevice(int node, const fru::LocatorView& loc) {
     const unsigned rc = IpmiIfcReadFru(node, id, word, 0, &length, n.fruState.header);
     if (rc != 0) {
         ipmiLog(LOG_WARNING, "IpmiIfcFruInstantiateAll: FRU 0x%x common header not read (0x%x)", id, rc);
-        return nullptr;
+        return unreachable(rc) ? previous : nullptr;
     }
     n.fruState.header_len = length;
     memcpy(&header, n.fruState.header, sizeof header);
@@ -172,15 +210,22 @@ std::shared_ptr<IpmiFru> readDevice(int node, const fru::LocatorView& loc) {
     }
 
     IpmiFru::OptionalRefArray areas;
-    areas[IpmiFru::FRU_AREA_CHASSIS] =
-        readInfoArea<IpmiFruChassis>(node, id, word, header.chassis_offset, areaSize, "chassis");
-    areas[IpmiFru::FRU_AREA_BOARD] = readInfoArea<IpmiFruBoard>(node, id, word, header.board_offset, areaSize, "board");
-    areas[IpmiFru::FRU_AREA_PRODUCT] =
-        readInfoArea<IpmiFruProduct>(node, id, word, header.product_offset, areaSize, "product");
-    areas[IpmiFru::FRU_AREA_MULTI] = readMultiArea(node, id, word, header.multi_offset, areaSize);
+    bool lost[IpmiFru::FRU_AREA_COUNT] = {};
+    areas[IpmiFru::FRU_AREA_CHASSIS] = readInfoArea<IpmiFruChassis>(node, id, word, header.chassis_offset, areaSize,
+                                                                    "chassis", lost[IpmiFru::FRU_AREA_CHASSIS]);
+    areas[IpmiFru::FRU_AREA_BOARD] = readInfoArea<IpmiFruBoard>(node, id, word, header.board_offset, areaSize,
+                                                                "board", lost[IpmiFru::FRU_AREA_BOARD]);
+    areas[IpmiFru::FRU_AREA_PRODUCT] = readInfoArea<IpmiFruProduct>(node, id, word, header.product_offset, areaSize,
+                                                                    "product", lost[IpmiFru::FRU_AREA_PRODUCT]);
+    areas[IpmiFru::FRU_AREA_MULTI] =
+        readMultiArea(node, id, word, header.multi_offset, areaSize, lost[IpmiFru::FRU_AREA_MULTI]);
+    if (previous)
+        for (size_t k = 0; k < areas.size(); ++k)
+            if (lost[k]) areas[k] = previous->getOptionalRefArray()[k];
 
-    auto device = std::make_shared<IpmiFru>(node, id, locatorName(loc),
-                                            IpmiEntity(loc.entityId(), loc.entityInstance(), 0, node), header);
+    // The locator's instance byte carries the device-relative flag in bit 7.
+    auto device = std::make_shared<IpmiFru>(
+        node, id, locatorName(loc), IpmiEntity(loc.entityId(), loc.entityInstance() & 0x7F, 0, node), header);
     device->setOptionalRefArray(areas);
     return device;
 }
@@ -224,6 +269,7 @@ unsigned int IpmiIfcReadFru(int node, unsigned char deviceId, unsigned char word
     uint8_t request[fru::readRequest::length];
     request[fru::readRequest::deviceId] = deviceId;
     for (;;) {
+        if (t_pass != nullptr && t_pass->readsLeft-- <= 0) return kFailed;
         const int largest = maxRequest();
         const unsigned chunk = wanted < static_cast<unsigned>(largest) ? wanted : static_cast<unsigned>(largest);
         request[fru::readRequest::offset] = static_cast<uint8_t>(offset & 0xFF);
@@ -238,11 +284,17 @@ unsigned int IpmiIfcReadFru(int node, unsigned char deviceId, unsigned char word
         const uint8_t code = resp->cc;
         if (code == cc::ok) {
             const unsigned n = resp->data_len > fru::readAnswer::count ? resp->data[fru::readAnswer::count] : 0;
-            if (n > chunk || resp->data_len < fru::readAnswer::data + n) {
+            if (n > chunk) {
                 ipmiLog(LOG_INFO,
                         "IpmiIfcReadFru: Response payload larger than expected (corrupt?) datalen: 0x%x, data[1]: "
                         "0x%x > 0x%x",
                         resp->data_len, n, chunk);
+                return kFailed;
+            }
+            if (resp->data_len < fru::readAnswer::data + n) {
+                ipmiLog(LOG_INFO,
+                        "IpmiIfcReadFru: Response shorter than its count (corrupt?) datalen: 0x%x, data[1]: 0x%x",
+                        resp->data_len, n);
                 return kFailed;
             }
             if (n == 0 && ++emptyAnswers >= kMaxEmptyAnswers) {
@@ -267,7 +319,8 @@ unsigned int IpmiIfcReadFru(int node, unsigned char deviceId, unsigned char word
                     largest - 1);
             continue;
         }
-        if ((code == cc::nodeBusy || code == cc::timeout) && retries < kRetries) {
+        if ((code == cc::nodeBusy || code == cc::timeout) && retries < kRetries &&
+            (t_pass == nullptr || t_pass->retriesLeft-- > 0)) {
             ++retries;
             ipmiLog(LOG_INFO, "IpmiIfcReadFru: Timeout on 0x%x cc=0x%x after reading some data... retrying %d",
                     deviceId, code, retries);
@@ -284,14 +337,8 @@ unsigned int IpmiIfcReadFru(int node, unsigned char deviceId, unsigned char word
 }
 
 unsigned int IpmiIfruInfoAreaLength(int node, unsigned char deviceId, unsigned char wordAccess, unsigned int offset) {
-    uint8_t head[fru::infoArea::headerLength];
-    unsigned length = sizeof head;
-    const unsigned rc = IpmiIfcReadFru(node, deviceId, wordAccess, static_cast<int>(offset), &length, head);
-    if (rc != 0) {
-        ipmiLog(LOG_ERR, "IpmiIfruInfoAreaLength: Reading FRU for 0x%x at 0x%x FAILED cc=0x%x", deviceId, offset, rc);
-        return 0;
-    }
-    return head[fru::infoArea::length] * fru::kUnit;
+    unsigned rc = 0;
+    return infoAreaLength(node, deviceId, wordAccess, offset, rc);
 }
 
 bool IpmiIfcFruChecksum(unsigned char* data, unsigned char* sum, unsigned int length) {
@@ -300,6 +347,26 @@ bool IpmiIfcFruChecksum(unsigned char* data, unsigned char* sum, unsigned int le
 }
 
 unsigned int IpmiIfcFruMultiLength(int node, unsigned char deviceId, unsigned int offset) {
+    unsigned rc = 0;
+    return multiLength(node, deviceId, offset, rc);
+}
+
+namespace {
+
+// The length of the info area at `offset`; 0, with the read's result in `rc`, when it cannot be read.
+unsigned infoAreaLength(int node, uint8_t deviceId, uint8_t wordAccess, unsigned offset, unsigned& rc) {
+    uint8_t head[fru::infoArea::headerLength];
+    unsigned length = sizeof head;
+    rc = IpmiIfcReadFru(node, deviceId, wordAccess, static_cast<int>(offset), &length, head);
+    if (rc != 0) {
+        ipmiLog(LOG_ERR, "IpmiIfruInfoAreaLength: Reading FRU for 0x%x at 0x%x FAILED cc=0x%x", deviceId, offset, rc);
+        return 0;
+    }
+    return head[fru::infoArea::length] * fru::kUnit;
+}
+
+// The multi-record chain's length; a failed header read ends it, its result in `rc`.
+unsigned multiLength(int node, uint8_t deviceId, unsigned offset, unsigned& rc) {
     const IpmiNode& n = g_IpmiNode[validNode(node) ? node : 0];
     const uint8_t word = cachedWordAccess(n);
     const unsigned areaSize = cachedAreaSize(n);
@@ -312,7 +379,7 @@ unsigned int IpmiIfcFruMultiLength(int node, unsigned char deviceId, unsigned in
         }
         uint8_t head[fru::multi::headerLength];
         unsigned length = sizeof head;
-        const unsigned rc = IpmiIfcReadFru(node, deviceId, word, static_cast<int>(offset + total), &length, head);
+        rc = IpmiIfcReadFru(node, deviceId, word, static_cast<int>(offset + total), &length, head);
         if (rc != 0) {
             ipmiLog(LOG_ERR, "IpmiIfcFruMultiLength: Reading FRU Multi Record Header for 0x%x at offset 0x%x FAILED cc=0x%x",
                     deviceId, offset + total, rc);
@@ -328,15 +395,17 @@ unsigned int IpmiIfcFruMultiLength(int node, unsigned char deviceId, unsigned in
     }
 }
 
+}  // namespace
+
 int IpmiIfcFruInstantiateAll(int node) {
     if (!validNode(node)) return -1;
     IpmiNode& n = g_IpmiNode[node];
     __atomic_store_n(&fru_max_req_size, kLargestRequest, __ATOMIC_RELAXED);
 
-    std::vector<std::shared_ptr<IpmiFru>> found;
+    // The devices this controller serves, each once, in repository order.
+    std::vector<std::vector<uint8_t>> devices;
     std::set<uint8_t> seen;
-    for (const auto& record : copyLocators(n)) {
-        if (n.stopRequested) return 0;  // the list in place stays
+    for (auto& record : copyLocators(n)) {
         const fru::LocatorView loc(record.data(), record.size());
         if (!loc.logical() || loc.accessAddress() != kBmcAddress || loc.channel() != 0 || loc.accessLun() != 0) {
             ipmiLog(LOG_DEBUG,
@@ -345,9 +414,35 @@ int IpmiIfcFruInstantiateAll(int node) {
                     loc.deviceId(), loc.accessAddress(), loc.channel());
             continue;
         }
-        if (!seen.insert(loc.deviceId()).second) continue;
-        if (auto device = readDevice(node, loc)) found.push_back(std::move(device));
+        if (seen.insert(loc.deviceId()).second) devices.push_back(std::move(record));
     }
+    std::map<uint8_t, std::shared_ptr<IpmiFru>> previous;
+    for (auto& device : IpmiIfc::getFrus(node)) previous[device->getDeviceId()] = device;
+
+    PassBudget budget;
+    t_pass = &budget;
+    std::vector<std::shared_ptr<IpmiFru>> read(devices.size());
+    const size_t start = g_resumeAt[node] < devices.size() ? g_resumeAt[node] : 0;
+    size_t next = 0;
+    for (size_t k = 0; k < devices.size(); ++k) {
+        const size_t i = (start + k) % devices.size();
+        const fru::LocatorView loc(devices[i].data(), devices[i].size());
+        auto before = previous.find(loc.deviceId());
+        const std::shared_ptr<IpmiFru> old = before != previous.end() ? before->second : nullptr;
+        if (n.stopRequested || passSpent()) {
+            read[i] = old;  // read on the next pass
+            continue;
+        }
+        read[i] = readDevice(node, loc, old);
+        next = (i + 1) % devices.size();
+    }
+    t_pass = nullptr;
+    if (n.stopRequested) return 0;  // the list in place stays
+    g_resumeAt[node] = budget.readsLeft <= 0 ? next : 0;
+
+    std::vector<std::shared_ptr<IpmiFru>> found;
+    for (auto& device : read)
+        if (device) found.push_back(std::move(device));
     {
         // Readers copy the pointers out; the old objects die with their last holder.
         CacheWriteLock guard(n.cacheLock);

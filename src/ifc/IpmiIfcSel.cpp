@@ -1,6 +1,15 @@
 // SEL access: follows the controller's SEL from the Get SEL Info answers that
 // the polling loop asks for, reads new records, and hands each new event
-// record to the registered handlers; plus the public SEL entry points.
+// record to the registered handlers once; plus the public SEL entry points.
+// The handler list itself is in IpmiIfcSelHandlers.cpp.
+//
+// What has been delivered is told by the record, never by a time stamp alone:
+// every record held carries a mark, set when it goes to the handlers or when
+// it belongs to the log found at start. A reload carries the marks over to
+// the records it reads again (same ID, same bytes). So events within one
+// second, a clock set back, records logged while a pass reads, a log that
+// overwrites its oldest records and handlers that clear the log still see
+// each record once, in log order.
 
 #include "IpmiIfcSel.h"
 
@@ -12,6 +21,7 @@
 #include <array>
 #include <atomic>
 #include <mutex>
+#include <set>
 #include <vector>
 
 #include "IpmiIfcInternal.h"
@@ -28,12 +38,12 @@ constexpr int kClearAttempts = 5;
 constexpr unsigned kBusySeconds = 1;
 constexpr unsigned kClearBusySeconds = 5;
 constexpr uint8_t kRecordIdVersionNibbleMin = 2;
-
-// Results of registering and unregistering a handler.
-constexpr int kHandlerOk = 0;
-constexpr int kHandlerNotRegistered = 2;
-constexpr int kHandlerMissing = 5;
-
+// What one pass may spend: failed attempts in all (busy, cancelled
+// reservations, bad answers), and records read. A controller that claims
+// more, or fails for ever, gets the rest on the next pass, so a pass never
+// holds the SEL for long at a few milliseconds an exchange.
+constexpr int kPassFailures = 16;
+constexpr uint32_t kPassRecords = 4096;
 
 IpmiNode& slot(int node) { return g_IpmiNode[(node >= 0 && node < IPMI_NODE_COUNT) ? node : 0]; }
 int slotIndex(int node) { return (node >= 0 && node < IPMI_NODE_COUNT) ? node : 0; }
@@ -41,128 +51,66 @@ int slotIndex(int node) { return (node >= 0 && node < IPMI_NODE_COUNT) ? node : 
 // Sleeps a pseudo-random 0-3 seconds, as the retry rules want.
 void sleepTimeAnd3() { sleep(static_cast<unsigned>(time(nullptr) & 3)); }
 
-// Makes the passes of one node run one at a time (a handler that clears the
-// SEL starts a nested pass on its own thread).
-struct SelFollow {
-    std::recursive_mutex follow;
+using RecordKey = std::array<uint8_t, sel::recordSize>;
+
+RecordKey keyOf(const sel_event_record& r) {
+    RecordKey k;
+    memcpy(k.data(), &r, k.size());
+    return k;
+}
+
+// How a node follows its controller's log. All but `pass` under the node's selMutex.
+struct Follow {
+    std::recursive_mutex pass;         // one pass at a time; a handler's clearSel nests on its thread
+    std::vector<uint8_t> handled;      // beside selRecords: delivered, or in the log found at start
+    size_t firstUnhandled = 0;         // no record before it waits
+    uint32_t foundAtStart = 0;         // records of the log found at start still to be read
+    std::set<RecordKey> carried;       // records handled before a reload, until a whole read
+    // Records read but not yet handed over when a reload (a clear from a
+    // handler, say) took them out of the list: they go first.
+    std::vector<std::shared_ptr<IpmiSelData>> pending;
+    bool readOn = false;               // the last pass stopped short of the log's end
+    IpmiSelCursor resumeAfter;         // set by resumeSelDelivery until the first pass
+    bool cursorDue = false;            // resumeAfter waits for a whole read of the log
+    bool holdForHandler = false;       // records wait for the first registered handler
 };
 
-SelFollow& followOf(int node) {
-    static SelFollow* state = new SelFollow[IPMI_NODE_COUNT];  // never destroyed: may run during exit
+Follow& followOf(int node) {
+    static Follow* state = new Follow[IPMI_NODE_COUNT];  // never destroyed: may run during exit
     return state[slotIndex(node)];
 }
 
-// Handler walks of node 0's list. Entries unlinked while a walk runs get a
-// null function at once, so no walk calls them after unRegister returns, and
-// are freed only when no walk runs, so a walk standing on one goes on safely.
-struct HandlerWalks {
-    int walks = 0;
-    std::vector<ipmiifc_sel_handler*> retired;
-    struct Call {
-        const ipmiifc_sel_handler* entry;
-        pthread_t thread;
-    };
-    std::vector<Call> calls;  // handler calls running now
-    pthread_cond_t callEnded = PTHREAD_COND_INITIALIZER;
-};
+// Passes and deliveries running on this thread: a pass started from a
+// handler (clearSel) leaves the delivery to the walk it interrupted, so
+// every handler still sees the log in order.
+thread_local int t_passDepth = 0;
+thread_local int t_delivering = 0;
 
-HandlerWalks& handlerWalks() {
-    static HandlerWalks* walks = new HandlerWalks();  // never destroyed: may run during exit
-    return *walks;
-}
-
-// Takes an entry out of use; selMutex held.
-void retire(HandlerWalks& w, ipmiifc_sel_handler* e) {
-    e->handler = nullptr;
-    if (w.walks > 0)
-        w.retired.push_back(e);
-    else
-        delete e;
-}
-
-bool runningElsewhere(const HandlerWalks& w, const ipmiifc_sel_handler* e) {
-    for (const auto& c : w.calls)
-        if (c.entry == e && !pthread_equal(c.thread, pthread_self())) return true;
-    return false;
-}
-
-// Scope of one walk, and of one handler call within it; both run with
-// selMutex held at construction and destruction.
-class WalkScope {
+class Depth {
 public:
-    explicit WalkScope(HandlerWalks& w) : w_(w) { ++w_.walks; }
-    ~WalkScope() {
-        if (--w_.walks > 0) return;
-        for (ipmiifc_sel_handler* e : w_.retired) delete e;
-        w_.retired.clear();
-    }
-    WalkScope(const WalkScope&) = delete;
-    WalkScope& operator=(const WalkScope&) = delete;
+    explicit Depth(int& d) : d_(d) { ++d_; }
+    ~Depth() { --d_; }
+    Depth(const Depth&) = delete;
+    Depth& operator=(const Depth&) = delete;
 
 private:
-    HandlerWalks& w_;
+    int& d_;
 };
 
-class CallScope {
-public:
-    CallScope(HandlerWalks& w, const ipmiifc_sel_handler* e) : w_(w), e_(e) {
-        w_.calls.push_back(HandlerWalks::Call{e, pthread_self()});
-    }
-    ~CallScope() {
-        for (auto it = w_.calls.begin(); it != w_.calls.end(); ++it) {
-            if (it->entry == e_ && pthread_equal(it->thread, pthread_self())) {
-                w_.calls.erase(it);
-                break;
-            }
-        }
-        pthread_cond_broadcast(&w_.callEnded);
-    }
-    CallScope(const CallScope&) = delete;
-    CallScope& operator=(const CallScope&) = delete;
-
-private:
-    HandlerWalks& w_;
-    const ipmiifc_sel_handler* e_;
+struct PassBudget {
+    PassBudget(int node, uint32_t records) : n(slot(node)), recordsLeft(std::min(records, kPassRecords)) {}
+    bool stopped() const { return n.stopRequested.load(std::memory_order_acquire); }
+    // Counts one failed attempt; false once the pass may spend no more.
+    bool fail() { return --failuresLeft > 0 && !stopped(); }
+    IpmiNode& n;
+    int failuresLeft = kPassFailures;
+    uint32_t recordsLeft;
 };
 
-// Releases a held mutex for a scope.
-class Unlocked {
-public:
-    explicit Unlocked(TAV::Mutex& m) : m_(m) { pthread_mutex_unlock(m_.native()); }
-    ~Unlocked() { pthread_mutex_lock(m_.native()); }
-    Unlocked(const Unlocked&) = delete;
-    Unlocked& operator=(const Unlocked&) = delete;
-
-private:
-    TAV::Mutex& m_;
-};
-
-// Beside each node's record list, under its selMutex: the latest event time
-// stamp among the records up to each position. Delivery starts where that
-// first passes `since`: every record before holds nothing newer, so a log of
-// thousands is not looked through for the one record that came.
-std::vector<uint32_t> g_latestStampUpTo[IPMI_NODE_COUNT];
-
-std::vector<uint32_t>& latestStampUpTo(const IpmiNode& n) { return g_latestStampUpTo[&n - g_IpmiNode]; }
-
-// Empties the node's record list into `out` (released outside the lock).
-void takeRecords(IpmiNode& n, std::vector<std::shared_ptr<IpmiSelData>>& out) {
-    TAV::MutexLock guard(n.selMutex);
-    out.swap(n.selRecords);
-    latestStampUpTo(n).clear();
-}
-
-// Puts one record read into the list; selMutex not held.
-void appendRecord(int node, ipmiifc_sel_entry& entry) {
-    IpmiNode& n = slot(node);
-    auto record = std::make_shared<IpmiSelData>(&entry.record, 0);
-    const uint32_t stamp = record->isSelEventRecord() ? record->messageTimeStamp() : 0;
-    TAV::MutexLock guard(n.selMutex);
-    std::vector<uint32_t>& latest = latestStampUpTo(n);
-    latest.push_back(latest.empty() || latest.back() < stamp ? stamp : latest.back());
-    n.selRecords.push_back(std::move(record));
-    n.work.sel.last_record_id = sel::le16(entry.record.record_id);
-}
+uint32_t readEntry(int node, ipmiifc_sel_entry* entry, PassBudget* budget);
+void appendRecord(int node, const ipmiifc_sel_entry& entry);
+bool getAll(int node, bool* whole);
+void deliverDue(int node);
 
 ipmiifc_sel_info headerOf(const IpmiNode& n) {
     ipmiifc_sel_info h;
@@ -186,6 +134,82 @@ uint16_t storedEntryCount(IpmiNode& n) {
     return sel::le16(n.work.sel.header + sel::info::entries);
 }
 
+// Empties the node's record list into `out` (released outside the lock).
+// With `carry`, the records handled so far stay handled when read again.
+void takeRecords(int node, std::vector<std::shared_ptr<IpmiSelData>>& out, bool carry) {
+    IpmiNode& n = slot(node);
+    Follow& f = followOf(node);
+    TAV::MutexLock guard(n.selMutex);
+    out.swap(n.selRecords);
+    if (carry) {
+        for (size_t i = 0; i < out.size() && i < f.handled.size(); ++i) {
+            if (!f.handled[i]) f.pending.push_back(out[i]);  // its copy read again counts as handled
+            f.carried.insert(keyOf(out[i]->record()));
+        }
+    }
+    f.handled.clear();
+    f.firstUnhandled = 0;
+}
+
+// The first answer since the node was set up: the log it finds is not news,
+// unless a caller resumes delivery after a record of it.
+void startFollowing(int node, uint16_t entries) {
+    std::vector<std::shared_ptr<IpmiSelData>> previous;  // held from before a restart
+    takeRecords(node, previous, false);
+    Follow& f = followOf(node);
+    TAV::MutexLock guard(slot(node).selMutex);
+    f.carried.clear();
+    f.pending.clear();
+    f.readOn = false;
+    f.cursorDue = f.resumeAfter.digest != 0;
+    f.holdForHandler = f.cursorDue;
+    f.foundAtStart = f.cursorDue ? 0 : entries;
+}
+
+// Drops the oldest records the controller no longer holds: a log that
+// overwrites its oldest records keeps its erase stamp, and the list would
+// otherwise grow without end. Only records already handled go.
+void dropVanished(int node, uint16_t entries) {
+    IpmiNode& n = slot(node);
+    Follow& f = followOf(node);
+    std::vector<std::shared_ptr<IpmiSelData>> gone;  // released outside the lock
+    TAV::MutexLock guard(n.selMutex);
+    size_t drop = 0;
+    while (n.selRecords.size() - drop > entries && drop < f.handled.size() && f.handled[drop]) ++drop;
+    if (drop == 0) return;
+    gone.assign(n.selRecords.begin(), n.selRecords.begin() + static_cast<long>(drop));
+    n.selRecords.erase(n.selRecords.begin(), n.selRecords.begin() + static_cast<long>(drop));
+    f.handled.erase(f.handled.begin(), f.handled.begin() + static_cast<long>(drop));
+    f.firstUnhandled = f.firstUnhandled > drop ? f.firstUnhandled - drop : 0;
+}
+
+// After a pass: a whole read ends what a reload carried, and places the
+// resume cursor. The records up to the cursor's own reached a handler
+// before the restart; when that record is gone, its time stamp tells.
+void endPass(int node, bool whole) {
+    IpmiNode& n = slot(node);
+    Follow& f = followOf(node);
+    TAV::MutexLock guard(n.selMutex);
+    f.readOn = !whole;
+    if (!whole) return;
+    f.carried.clear();
+    if (!f.cursorDue) return;
+    const IpmiSelCursor c = f.resumeAfter;
+    size_t match = n.selRecords.size();
+    for (size_t i = 0; i < n.selRecords.size(); ++i) {
+        const IpmiSelData& r = *n.selRecords[i];
+        if (r.recordId() == c.recordId && IpmiSelCursor::digestOf(r.record()) == c.digest) match = i;
+    }
+    for (size_t i = 0; i < n.selRecords.size(); ++i) {
+        const IpmiSelData& r = *n.selRecords[i];
+        const bool before = match < n.selRecords.size() ? i <= match : r.messageTimeStamp() <= c.timestamp;
+        f.handled[i] = !r.isSelEventRecord() || before;
+    }
+    f.firstUnhandled = 0;
+    f.cursorDue = false;
+    f.resumeAfter = IpmiSelCursor();
+}
+
 // Records read in one pass, to end a chain of next IDs that loops back.
 class SeenIds {
 public:
@@ -195,37 +219,64 @@ public:
         seen_[id] = true;
         return true;
     }
+    bool contains(uint16_t id) const { return !seen_.empty() && seen_[id]; }
 
 private:
     std::vector<bool> seen_;
 };
 
-// Reads the records after `last` (all of them from 0), at most `limit`
-// requests, and stops where the next ID points back to a record of this pass.
-uint32_t readNew(int node, uint16_t last, uint32_t limit) {
+enum class ChainEnd { LogEnd, Failed, Cut };
+
+struct ChainWalk {
+    ChainEnd end;
+    uint32_t rc;      // the failed read's result
+    uint8_t code;     // its last completion code
+    bool atFirst;     // the read of the starting record failed
+};
+
+// Reads along the controller's next-ID chain from `from` (0: the first
+// record) and appends each record read, but `from` itself when it is held
+// already. Ends at the log's end, where the chain points back to a record
+// of this walk, after `requests` reads, or when the pass's budget is spent
+// (Cut). A failed read is asked again when `retry` (it counts as a
+// request); otherwise it ends the walk.
+ChainWalk walkChain(int node, uint16_t from, bool fromIsHeld, uint32_t requests, bool retry, PassBudget& budget) {
     ipmiifc_sel_entry entry;
     memset(&entry, 0, sizeof entry);
-    sel::putLe16(entry.next_id, last);
-    uint32_t rc = IpmiIfcSelReadEntry(node, &entry);
-    if (rc != 0) return rc;
+    sel::putLe16(entry.next_id, from);
     SeenIds seen;
-    seen.insert(sel::le16(entry.record.record_id));
-    if (last == 0) appendRecord(node, entry);
-    for (uint32_t requests = 1;; ++requests) {
-        const uint16_t next = sel::le16(entry.next_id);
-        if (next == sel::lastRecord || !seen.insert(next) || requests >= limit) return 0;
-        rc = IpmiIfcSelReadEntry(node, &entry);
+    bool first = true;
+    for (uint32_t request = 0; request < requests; ++request) {
+        if (budget.stopped() || budget.recordsLeft == 0) break;
+        const uint32_t rc = readEntry(node, &entry, &budget);
         if (rc != 0) {
-            ipmiLog(LOG_ERR, "%s: failed call to IpmiIfcSelReadEntry cc = 0x%x", "IpmiIfcSelReadNew", rc & 0xFF);
-            return rc;
+            if (budget.failuresLeft <= 0 || budget.stopped()) break;
+            if (retry) continue;
+            return ChainWalk{ChainEnd::Failed, rc, entry.cc, first};
         }
-        appendRecord(node, entry);
+        --budget.recordsLeft;
+        if (!seen.insert(sel::le16(entry.record.record_id))) return ChainWalk{ChainEnd::LogEnd, 0, 0, false};
+        if (!(first && fromIsHeld)) appendRecord(node, entry);
+        first = false;
+        const uint16_t next = sel::le16(entry.next_id);
+        if (next == sel::lastRecord || seen.contains(next)) return ChainWalk{ChainEnd::LogEnd, 0, 0, false};
     }
+    return ChainWalk{ChainEnd::Cut, 0, 0, false};
+}
+
+// Reads the log again from its start, keeping what was handled.
+bool reload(int node) {
+    std::vector<std::shared_ptr<IpmiSelData>> previous;  // released outside the lock
+    takeRecords(node, previous, true);
+    previous.clear();
+    bool whole = false;
+    getAll(node, &whole);
+    return whole;
 }
 
 }  // namespace
 
-// ---- Controller requests ---------------------------------------------------
+// ---- Following the controller's SEL -----------------------------------------
 
 uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count) {
     RespHolder r(IpmiIfcSendCmd(node, cmd::getSelInfo, netfn::storage, 0, 0, nullptr, 0));
@@ -238,6 +289,82 @@ uint32_t IpmiIfcSelGetInfo(int node, uint16_t* count) {
     }
     return IpmiIfcRhSelInfo(r.get(), count);
 }
+
+// `count` gets only the low byte of the entry count: a log of 300 entries
+// reports 44. The polling loop compares counts from pass to pass and relies on this.
+//
+// Unchanged stamps and count mean nothing new, unless the last pass stopped
+// short. Otherwise the records after the last one read are read (the erase
+// stamp kept), or the whole log again (it moved, or command-line mode).
+uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
+    if (resp == nullptr || resp->cc != 0 || resp->data_len < sel::info::size) return kSelFailed;
+    if (count) *count = resp->data[sel::info::entries];
+    const int node = resp->node;
+    IpmiNode& n = slot(node);
+    Follow& f = followOf(node);
+    std::lock_guard<std::recursive_mutex> pass(f.pass);
+    Depth depth(t_passDepth);
+    const bool cli = _getState(0) == IpmiIfc::IPMI_STATE_CLI;
+    const uint32_t newAdd = sel::le32(resp->data + sel::info::additionTimestamp);
+    const uint32_t newErase = sel::le32(resp->data + sel::info::eraseTimestamp);
+    const uint16_t newCount = sel::le16(resp->data + sel::info::entries);
+    uint32_t oldAdd, oldErase;
+    uint16_t oldCount, last;
+    bool nothingStored, readOn;
+    {
+        TAV::MutexLock guard(n.selMutex);
+        const ipmiifc_sel_info stored = headerOf(n);
+        oldAdd = stored.addition_timestamp;
+        oldErase = stored.erase_timestamp;
+        oldCount = stored.entries;
+        nothingStored = stored.version == 0 && oldAdd == 0 && oldErase == 0;
+        last = n.work.sel.last_record_id;
+        readOn = f.readOn;
+    }
+    // Stamps count seconds: a grown count is news within the same second too.
+    if (!cli && oldAdd == newAdd && oldErase == newErase && oldCount == newCount && !readOn) return 0;
+    if (nothingStored) startFollowing(node, newCount);
+
+    bool whole;
+    if (!cli && oldErase == newErase) {
+        dropVanished(node, newCount);
+        IpmiIfcSelReserve(node);
+        PassBudget budget(node, static_cast<uint32_t>(newCount) + 1);
+        const ChainWalk w = walkChain(node, last, last != 0, static_cast<uint32_t>(newCount) + 1, false, budget);
+        if (w.end == ChainEnd::Failed && w.atFirst && w.code == cc::requestedSensorNotPresent && last != 0) {
+            // The last record read is gone with the erase stamp unchanged: the
+            // log overwrote its oldest records. Reading on from it would fail
+            // on every pass; only the log's start tells where it goes on.
+            {
+                TAV::MutexLock guard(n.selMutex);
+                storeHeader(n, resp->data, node);
+                n.work.sel.last_record_id = 0;
+            }
+            whole = reload(node);
+        } else {
+            if (w.end == ChainEnd::Failed && !w.atFirst)
+                ipmiLog(LOG_ERR, "%s: failed call to IpmiIfcSelReadEntry cc = 0x%x", "IpmiIfcSelReadNew", w.rc & 0xFF);
+            whole = w.end == ChainEnd::LogEnd;
+        }
+        TAV::MutexLock guard(n.selMutex);
+        storeHeader(n, resp->data, node);
+    } else {
+        {
+            TAV::MutexLock guard(n.selMutex);
+            storeHeader(n, resp->data, node);
+            n.work.sel.last_record_id = 0;
+            // A cleared log holds nothing of the one found at start.
+            if (!nothingStored) f.foundAtStart = 0;
+        }
+        IpmiIfcSelReserve(node);
+        whole = reload(node);
+    }
+    endPass(node, whole);
+    if (t_delivering == 0) deliverDue(node);
+    return 0;
+}
+
+int IpmiIfcRhSelInfoNoCount(ipmiifc_resp* resp) { return static_cast<int>(IpmiIfcRhSelInfo(resp, nullptr)); }
 
 int IpmiIfcRhSelGetAllocInfo(ipmiifc_resp* resp) {
     if (resp == nullptr) return -1;
@@ -253,6 +380,66 @@ int IpmiIfcRhSelGetAllocInfo(ipmiifc_resp* resp) {
     memcpy(store, resp->data, resp->data_len < size ? resp->data_len : size);
     return 0;
 }
+
+uint32_t IpmiIfcSelGetAll(int node) { return getAll(node, nullptr) ? 0 : kSelFailed; }
+
+// At most as many reads as the controller says it holds records; a failed
+// read asks for the same record again.
+uint32_t IpmiIfcSelReadAll(int node) {
+    const uint32_t count = storedEntryCount(slot(node));
+    if (count == 0) return kSelFailed;
+    PassBudget budget(node, count);
+    walkChain(node, sel::firstRecord, false, count, true, budget);
+    return 0;
+}
+
+namespace {
+
+// Full reload with the version check. Inside a pass the header was just
+// stored: a version of 0 is the controller's own, and asking Get SEL Info
+// again would start the same reload again, without end.
+bool getAll(int node, bool* whole) {
+    // Logged once per process, whatever the node.
+    static std::atomic<bool> _invalid_version_logged{false};
+    IpmiNode& n = slot(node);
+    uint8_t version;
+    {
+        TAV::MutexLock guard(n.selMutex);
+        version = n.work.sel.header[sel::info::version];
+    }
+    if (version == 0 && t_passDepth == 0) {
+        if (IpmiIfcSelGetInfo(node, nullptr) != 0) return false;
+        TAV::MutexLock guard(n.selMutex);
+        version = n.work.sel.header[sel::info::version];
+    }
+    uint16_t reservation;
+    {
+        TAV::MutexLock guard(n.selMutex);
+        reservation = n.work.sel.reservation;
+    }
+    if (reservation == 0) IpmiIfcSelReserve(node);
+    if (version != sel::supportedVersion && (version & 0x0F) < kRecordIdVersionNibbleMin) {
+        if (!_invalid_version_logged.exchange(true)) {
+            ipmiLog(LOG_ERR, "IpmiIfcSelGetAll: invalid version. Version = 0x%x", version);
+        }
+        if (whole) *whole = true;  // nothing more to read from this log
+        return false;
+    }
+    const uint32_t count = storedEntryCount(n);
+    if (count == 0) {
+        ipmiLog(LOG_ERR, "IpmiIfcSelGetAll: node %d no record count", node);
+        if (whole) *whole = true;
+        return false;
+    }
+    PassBudget budget(node, count);
+    const ChainWalk w = walkChain(node, sel::firstRecord, false, count, true, budget);
+    if (whole) *whole = w.end == ChainEnd::LogEnd;
+    return true;
+}
+
+}  // namespace
+
+// ---- Reading records ---------------------------------------------------------
 
 uint32_t IpmiIfcSelReserve(int node) {
     RespHolder r(IpmiIfcSendCmd(node, cmd::reserveSel, netfn::storage, 0, 0, nullptr, 0));
@@ -278,12 +465,18 @@ uint32_t IpmiIfcSelReserve(int node) {
     return 0;
 }
 
+uint32_t IpmiIfcSelReadEntry(int node, ipmiifc_sel_entry* entry) { return readEntry(node, entry, nullptr); }
+
+namespace {
+
 // The record is read in chunks from its end towards its start: a short chunk
 // takes the tail of what is still missing. Every answer must name the record
 // asked for in its first two bytes, also a tail chunk's whose first bytes are
 // no record ID; so a record asked for by ID that needs chunks never completes.
-// Firmware has always been read this way.
-uint32_t IpmiIfcSelReadEntry(int node, ipmiifc_sel_entry* entry) {
+// Firmware has always been read this way. A pass's budget, when given, ends
+// the read early once the pass may spend no more; on failure entry->cc holds
+// the last completion code (0xFF: no answer).
+uint32_t readEntry(int node, ipmiifc_sel_entry* entry, PassBudget* budget) {
     IpmiNode& n = slot(node);
     const uint16_t wanted = sel::le16(entry->next_id);
     uint8_t record[sel::recordSize];
@@ -294,6 +487,7 @@ uint32_t IpmiIfcSelReadEntry(int node, ipmiifc_sel_entry* entry) {
     while (remaining > 0) {
         bool accepted = false;
         for (int attempt = 0; attempt < kChunkAttempts && !accepted; ++attempt) {
+            if (attempt > 0 && budget && !budget->fail()) break;
             const size_t count = std::min(chunk, remaining);
             const size_t offset = remaining - count;
             uint8_t request[sel::entryRequest::size];
@@ -305,7 +499,11 @@ uint32_t IpmiIfcSelReadEntry(int node, ipmiifc_sel_entry* entry) {
             request[sel::entryRequest::offset] = static_cast<uint8_t>(offset);
             request[sel::entryRequest::count] = static_cast<uint8_t>(count);
             RespHolder r(IpmiIfcSendCmd(node, cmd::getSelEntry, netfn::storage, 0, sizeof request, request, 0));
-            if (!r) continue;
+            if (!r) {
+                lastCode = 0xFF;
+                continue;
+            }
+            lastCode = r->cc;
             switch (r->cc) {
             case cc::ok:
                 break;
@@ -335,11 +533,14 @@ uint32_t IpmiIfcSelReadEntry(int node, ipmiifc_sel_entry* entry) {
             }
             memcpy(record + offset, r->data + sel::entryAnswer::data, count);
             memcpy(nextId, r->data + sel::entryAnswer::nextRecordId, sizeof nextId);
-            lastCode = r->cc;
             remaining -= count;
             accepted = true;
         }
-        if (!accepted) return kSelFailed;
+        if (!accepted) {
+            if (budget) budget->fail();  // the last attempt failed too
+            entry->cc = lastCode;
+            return kSelFailed;
+        }
     }
     if (lastCode == cc::requestedSensorNotPresent) return kSelFailed;
     if (lastCode != 0) {
@@ -352,232 +553,73 @@ uint32_t IpmiIfcSelReadEntry(int node, ipmiifc_sel_entry* entry) {
     return 0;
 }
 
-// At most as many reads as the controller says it holds records; a chain of
-// next IDs that loops back ends at the first record read twice.
-uint32_t IpmiIfcSelReadAll(int node) {
-    const uint32_t count = storedEntryCount(slot(node));
-    if (count == 0) return kSelFailed;
-    ipmiifc_sel_entry entry;
-    memset(&entry, 0, sizeof entry);
-    SeenIds seen;
-    for (uint32_t attempt = 0; attempt < count; ++attempt) {
-        if (IpmiIfcSelReadEntry(node, &entry) != 0) continue;  // the same record is asked for again
-        if (!seen.insert(sel::le16(entry.record.record_id))) break;
-        appendRecord(node, entry);
-        const uint16_t next = sel::le16(entry.next_id);
-        if (next == sel::lastRecord) break;
-    }
-    return 0;
-}
-
-uint32_t IpmiIfcSelReadNew(int node, uint16_t last) {
-    return readNew(node, last, static_cast<uint32_t>(storedEntryCount(slot(node))) + 1);
-}
-
-uint32_t IpmiIfcSelGetAll(int node) {
-    // Logged once per process, whatever the node.
-    static std::atomic<bool> _invalid_version_logged{false};
+// Puts one record read into the list with its mark; selMutex not held.
+void appendRecord(int node, const ipmiifc_sel_entry& entry) {
     IpmiNode& n = slot(node);
-    uint8_t version;
-    {
-        TAV::MutexLock guard(n.selMutex);
-        version = n.work.sel.header[sel::info::version];
+    Follow& f = followOf(node);
+    sel_event_record bytes = entry.record;
+    auto record = std::make_shared<IpmiSelData>(&bytes, 0);
+    bool handled = !record->isSelEventRecord();  // only event records are delivered
+    TAV::MutexLock guard(n.selMutex);
+    if (f.foundAtStart > 0) {
+        --f.foundAtStart;
+        handled = true;
+    } else if (!f.carried.empty() && f.carried.count(keyOf(entry.record)) != 0) {
+        handled = true;
     }
-    if (version == 0) {
-        if (IpmiIfcSelGetInfo(node, nullptr) != 0) return kSelFailed;
-        TAV::MutexLock guard(n.selMutex);
-        version = n.work.sel.header[sel::info::version];
-    }
-    uint16_t reservation;
-    {
-        TAV::MutexLock guard(n.selMutex);
-        reservation = n.work.sel.reservation;
-    }
-    if (reservation == 0) IpmiIfcSelReserve(node);
-    if (version != sel::supportedVersion && (version & 0x0F) < kRecordIdVersionNibbleMin) {
-        if (!_invalid_version_logged.exchange(true)) {
-            ipmiLog(LOG_ERR, "IpmiIfcSelGetAll: invalid version. Version = 0x%x", version);
-        }
-        return kSelFailed;
-    }
-    if (storedEntryCount(n) == 0) {
-        ipmiLog(LOG_ERR, "IpmiIfcSelGetAll: node %d no record count", node);
-        return kSelFailed;
-    }
-    return IpmiIfcSelReadAll(node);
+    n.selRecords.push_back(std::move(record));
+    f.handled.push_back(handled ? 1 : 0);
+    n.work.sel.last_record_id = sel::le16(entry.record.record_id);
 }
 
-// ---- Following the controller's SEL -----------------------------------------
+// The next record to hand over, marked handled; null when none is due. Records
+// a reload took out of the list come first: they are older than any in it.
+std::shared_ptr<IpmiSelData> takeNextDue(IpmiNode& n, Follow& f, bool anyHandler) {
+    TAV::MutexLock guard(n.selMutex);
+    if (f.cursorDue || (f.holdForHandler && !anyHandler)) return nullptr;
+    std::shared_ptr<IpmiSelData> record;
+    if (!f.pending.empty()) {
+        record = std::move(f.pending.front());
+        f.pending.erase(f.pending.begin());
+    } else {
+        size_t i = f.firstUnhandled;
+        while (i < f.handled.size() && f.handled[i]) ++i;
+        f.firstUnhandled = i;
+        if (i >= n.selRecords.size() || i >= f.handled.size()) return nullptr;
+        f.handled[i] = 1;
+        record = n.selRecords[i];
+    }
+    f.holdForHandler = false;
+    return record;
+}
 
-// `count` gets only the low byte of the entry count: a log of 300 entries
-// reports 44. The polling loop compares counts from pass to pass and relies on this.
-//
-// New records are told by time: records stamped at or before the addition
-// stamp the pass started from (`since`) are not delivered. So the log found
-// by the first answer loads without reaching any handler (`since` is then
-// the controller's own stamp), and a record reaches the handlers once, in
-// the pass that reads it.
-uint32_t IpmiIfcRhSelInfo(ipmiifc_resp* resp, uint16_t* count) {
-    if (resp == nullptr || resp->cc != 0 || resp->data_len < sel::info::size) return kSelFailed;
-    if (count) *count = resp->data[sel::info::entries];
-    const int node = resp->node;
+// Hands every record not yet handled to the handlers, oldest first, marking
+// it before the call: a pass that a handler starts (clearSel) finds it
+// handled. The list is looked at again after every record, so records
+// appended meanwhile, or a list a nested pass rebuilt, are followed too.
+void deliverDue(int node) {
+    if (_getState(0) == IpmiIfc::IPMI_STATE_CLI) return;
     IpmiNode& n = slot(node);
-    std::lock_guard<std::recursive_mutex> pass(followOf(node).follow);
-    const bool cli = _getState(0) == IpmiIfc::IPMI_STATE_CLI;
-    const uint32_t newAdd = sel::le32(resp->data + sel::info::additionTimestamp);
-    const uint32_t newErase = sel::le32(resp->data + sel::info::eraseTimestamp);
-    const uint16_t newCount = sel::le16(resp->data + sel::info::entries);
-    uint32_t oldAdd, oldErase;
-    uint16_t last;
-    bool nothingStored;
-    {
-        TAV::MutexLock guard(n.selMutex);
-        const ipmiifc_sel_info stored = headerOf(n);
-        oldAdd = stored.addition_timestamp;
-        oldErase = stored.erase_timestamp;
-        nothingStored = stored.version == 0 && oldAdd == 0 && oldErase == 0;
-        last = n.work.sel.last_record_id;
-    }
-    if (!cli && oldAdd == newAdd && oldErase == newErase) return 0;
-    const uint32_t since = oldAdd != 0 ? oldAdd : newAdd;
-
-    std::vector<std::shared_ptr<IpmiSelData>> previous;  // released outside the lock
-    if (!cli && oldErase == newErase) {
-        // Records held from before a restart would be read again behind themselves.
-        if (nothingStored) takeRecords(n, previous);
-        previous.clear();
-        IpmiIfcSelReserve(node);
-        readNew(node, last, static_cast<uint32_t>(newCount) + 1);
-        {
-            TAV::MutexLock guard(n.selMutex);
-            storeHeader(n, resp->data, node);
-        }
-        IpmiIfcSelGenerateEvents(node, since);
-        return 0;
-    }
-
-    {
-        TAV::MutexLock guard(n.selMutex);
-        storeHeader(n, resp->data, node);
-        n.work.sel.last_record_id = 0;
-    }
-    IpmiIfcSelReserve(node);
-    takeRecords(n, previous);
-    previous.clear();
-    IpmiIfcSelGetAll(node);
-    IpmiIfcSelGenerateEvents(node, since);
-    return 0;
+    Follow& f = followOf(node);
+    const bool anyHandler = IpmiIfcSelHasHandlers();
+    Depth delivering(t_delivering);
+    while (std::shared_ptr<IpmiSelData> record = takeNextDue(n, f, anyHandler))
+        IpmiIfcSelDeliverToHandlers(record.get());
 }
+
+}  // namespace
+
+void IpmiIfcSelGenerateEvents(int node) { deliverDue(node); }
 
 void IpmiIfcSelDropRecords(int node) {
     std::vector<std::shared_ptr<IpmiSelData>> gone;  // released outside the lock
-    takeRecords(slot(node), gone);
+    takeRecords(node, gone, false);
 }
 
-int IpmiIfcRhSelInfoNoCount(ipmiifc_resp* resp) { return static_cast<int>(IpmiIfcRhSelInfo(resp, nullptr)); }
-
-// Hands the event records stamped after `sinceTimestamp` to the handlers,
-// oldest first (0xFFFFFFFF: every event record). The list's length is read
-// again after each record, so records appended meanwhile are visited too.
-uint32_t IpmiIfcSelGenerateEvents(int node, uint32_t sinceTimestamp) {
-    if (_getState(0) == IpmiIfc::IPMI_STATE_CLI) return 0;
-    IpmiNode& n = slot(node);
-    auto due = [sinceTimestamp](const IpmiSelData& r) {
-        return r.isSelEventRecord() && (r.messageTimeStamp() > sinceTimestamp || sinceTimestamp == 0xFFFFFFFF);
-    };
-    for (size_t i = 0;; ++i) {
-        std::shared_ptr<IpmiSelData> record;
-        {
-            // Records not due are passed over under one lock.
-            TAV::MutexLock guard(n.selMutex);
-            const std::vector<uint32_t>& latest = latestStampUpTo(n);
-            if (i == 0 && sinceTimestamp != 0xFFFFFFFF && latest.size() == n.selRecords.size())
-                i = static_cast<size_t>(std::upper_bound(latest.begin(), latest.end(), sinceTimestamp) - latest.begin());
-            while (i < n.selRecords.size() && !due(*n.selRecords[i])) ++i;
-            if (i >= n.selRecords.size()) return 0;
-            record = n.selRecords[i];
-        }
-        IpmiIfcSelCallHandlers(record.get());
-    }
-}
-
-// ---- Handlers ------------------------------------------------------------------
-
-void IpmiIfcSelCallHandlers(IpmiSelData* record) {
-    IpmiNode& n = g_IpmiNode[0];
-    HandlerWalks& w = handlerWalks();
-    TAV::MutexLock guard(n.selMutex);
-    WalkScope walk(w);
-    for (ipmiifc_sel_handler* e = n.work.sel_handlers; e; e = e->next) {
-        const IpmiSelEventHandler handler = e->handler;
-        if (handler == nullptr) continue;
-        void* const context = e->context;
-        CallScope call(w, e);
-        Unlocked unlocked(n.selMutex);
-        handler(context, record);
-    }
-}
-
-// Registration always uses node 0's list, whatever node is named.
-int IpmiIfc::registerSelEventHandler(int, IpmiSelEventHandler handler, void* context) {
-    if (handler == nullptr) return kHandlerMissing;
-    IpmiNode& n = g_IpmiNode[0];
-    TAV::MutexLock guard(n.selMutex);
-    for (ipmiifc_sel_handler* e = n.work.sel_handlers; e; e = e->next)
-        if (e->handler == handler) return kHandlerOk;  // contexts are not compared
-    n.work.sel_handlers = new ipmiifc_sel_handler{n.work.sel_handlers, handler, context};
-    return kHandlerOk;
-}
-
-int IpmiIfc::registerSelEventHandler(IpmiSelEventHandler handler, void* context) {
-    return registerSelEventHandler(0, handler, context);
-}
-
-// A match behind the head is unlinked by pointing the HEAD past it, so any
-// entries between the head and the match leave the list too. Kept on purpose.
-// Returns once no other thread runs the handler any more, so the caller may
-// free its context; a handler that unregisters itself does not wait for itself.
-int IpmiIfc::unRegisterSelEventHandler(int, IpmiSelEventHandler handler) {
-    if (handler == nullptr) return kHandlerMissing;
-    IpmiNode& n = g_IpmiNode[0];
-    HandlerWalks& w = handlerWalks();
-    TAV::MutexLock guard(n.selMutex);
-    ipmiifc_sel_handler* head = n.work.sel_handlers;
-    if (head == nullptr) return kHandlerNotRegistered;
-    ipmiifc_sel_handler* match = nullptr;
-    if (head->handler == handler) {
-        match = head;
-        n.work.sel_handlers = head->next;
-    } else {
-        for (ipmiifc_sel_handler* e = head->next; e; e = e->next) {
-            if (e->handler != handler) continue;
-            match = e;
-            for (ipmiifc_sel_handler* cut = head->next; cut != e;) {
-                ipmiifc_sel_handler* following = cut->next;
-                retire(w, cut);
-                cut = following;
-            }
-            head->next = e->next;
-            break;
-        }
-    }
-    if (match == nullptr) return kHandlerNotRegistered;
-    match->handler = nullptr;  // a walk standing before it no longer calls it
-    while (runningElsewhere(w, match)) pthread_cond_wait(&w.callEnded, n.selMutex.native());
-    retire(w, match);
-    return kHandlerOk;
-}
-
-int IpmiIfc::unRegisterSelEventHandler(IpmiSelEventHandler handler) { return unRegisterSelEventHandler(0, handler); }
-
-void IpmiIfcSelCleanUpEventHandlers(int node) {
-    IpmiNode& n = slot(node);
-    HandlerWalks& w = handlerWalks();
-    TAV::MutexLock guard(n.selMutex);
-    while (ipmiifc_sel_handler* e = n.work.sel_handlers) {
-        n.work.sel_handlers = e->next;
-        retire(w, e);
-    }
+void IpmiIfc::resumeSelDelivery(int node, const IpmiSelCursor& after) {
+    Follow& f = followOf(node);
+    TAV::MutexLock guard(slot(node).selMutex);
+    f.resumeAfter = after;
 }
 
 bool IpmiIfc::generatesMemoryEvents(int node) {

@@ -23,13 +23,17 @@ static_assert(sizeof(ipmiifc_sel_entry) == 19, "SEL entry buffer is 19 bytes");
 uint32_t IpmiIfcSelReserve(int node);
 uint32_t IpmiIfcSelReadEntry(int node, ipmiifc_sel_entry* entry);
 uint32_t IpmiIfcSelReadAll(int node);
-uint32_t IpmiIfcSelReadNew(int node, uint16_t last);
 uint32_t IpmiIfcSelGetAll(int node);
-uint32_t IpmiIfcSelGenerateEvents(int node, uint32_t sinceTimestamp);
+// Hands the records not yet handled to the handlers, oldest first.
+void IpmiIfcSelGenerateEvents(int node);
 // Calls every registered handler with `record` (null from the polling loop's
 // periodic call), newest registration first, with the handler mutex released
 // around each call. A handler's exception ends the walk and passes on.
 void IpmiIfcSelCallHandlers(IpmiSelData* record);
+// The same for a record being delivered, but a handler's exception is logged
+// and the walk goes on: no handler's fault costs another one a record.
+void IpmiIfcSelDeliverToHandlers(IpmiSelData* record);
+bool IpmiIfcSelHasHandlers();
 
 // Requests on a descriptor of the caller's own, outside the node's transport:
 // the direct synchroniser and the SEL clock use them.

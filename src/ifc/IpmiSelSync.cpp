@@ -28,6 +28,8 @@ namespace {
 constexpr int kReplyWaitMs = 20000;
 constexpr int kWrongIdLimit = 10;
 constexpr int kExtraRecords = 10;
+constexpr int kCallRecords = 4096;
+constexpr int kCallFailures = 16;
 constexpr size_t kAnswerMax = IPMI_MAX_MSG_LENGTH;
 constexpr size_t kEntryAnswerSize = sel::entryAnswer::data + sel::recordSize;  // 19
 constexpr size_t kDeviceIdAnswerMin = 6;
@@ -67,11 +69,21 @@ bool send_cmd(int fd, uint8_t netfn, uint8_t cmd, const uint8_t* data, size_t le
     return true;
 }
 
-// Waits for the next response message; other message types are skipped.
+int64_t nowMs() {
+    struct timespec t;
+    clock_gettime(CLOCK_MONOTONIC, &t);
+    return static_cast<int64_t>(t.tv_sec) * 1000 + t.tv_nsec / 1000000;
+}
+
+// Waits for the next response message; other message types are skipped and
+// start a fresh wait. A device that reports an error has no answer to give:
+// polling it again would only spin.
 bool recv_reply(int fd, long* id, uint8_t* answer, size_t* answerLen) {
+    int64_t deadline = nowMs() + kReplyWaitMs;
     for (;;) {
         struct pollfd p = {fd, POLLIN, 0};
-        const int ready = ::poll(&p, 1, kReplyWaitMs);
+        const int64_t left = deadline - nowMs();
+        const int ready = left > 0 ? ::poll(&p, 1, static_cast<int>(left)) : 0;
         if (ready < 0) {
             if (errno == EINTR) continue;
             const int err = errno;
@@ -82,7 +94,14 @@ bool recv_reply(int fd, long* id, uint8_t* answer, size_t* answerLen) {
             ipmiLog(LOG_ERR, "%s: bmc timeout after %d millisconds", "recv_reply", kReplyWaitMs);
             return false;
         }
-        if (!(p.revents & POLLIN)) continue;
+        if (!(p.revents & POLLIN)) {
+            if (p.revents & (POLLERR | POLLHUP | POLLNVAL)) {
+                ipmiLog(LOG_ERR, "%s: poll(%d) reports a device error (revents 0x%x)", "recv_reply", fd,
+                        static_cast<unsigned>(p.revents));
+                return false;
+            }
+            continue;
+        }
         struct ipmi_system_interface_addr addr;
         struct ipmi_recv recv;
         memset(&recv, 0, sizeof recv);
@@ -104,6 +123,7 @@ bool recv_reply(int fd, long* id, uint8_t* answer, size_t* answerLen) {
         }
         if (recv.recv_type != IPMI_RESPONSE_RECV_TYPE) {
             ipmiLog(LOG_DEBUG, "%s:skipping msg type %d", "recv_reply", recv.recv_type);
+            deadline = nowMs() + kReplyWaitMs;
             continue;
         }
         *id = recv.msgid;
@@ -234,7 +254,9 @@ bool get_sel_reservation(int fd) {
 }
 
 // Record IDs are taken as consecutive from the last one seen; at most n + 1
-// requests, so IDs with gaps end the load early rather than never.
+// requests, so IDs with gaps end the load early rather than never. A call
+// also stops after kCallRecords records or kCallFailures answers without a
+// record: what a controller claims beyond that waits for the next call.
 bool load_events(int fd, Event_log* out, int* n, uint16_t* lastRecordId) {
     if (*n < 0) {
         *n = 0;
@@ -246,7 +268,8 @@ bool load_events(int fd, Event_log* out, int* n, uint16_t* lastRecordId) {
     const int capacity = *n;
     int loaded = 0;
     uint16_t last = *lastRecordId;
-    for (int request = 0; request <= capacity; ++request) {
+    int failures = 0;
+    for (int request = 0; request <= capacity && loaded < kCallRecords && failures < kCallFailures; ++request) {
         uint8_t req[sel::entryRequest::size];
         sel::putLe16(req + sel::entryRequest::reservation, mc_reservation);
         sel::putLe16(req + sel::entryRequest::recordId, id);
@@ -258,6 +281,7 @@ bool load_events(int fd, Event_log* out, int* n, uint16_t* lastRecordId) {
         if (len >= kEntryAnswerSize) {  // an 18-byte answer lacks the record's last byte
             const uint16_t next = sel::le16(a + sel::entryAnswer::nextRecordId);
             if (a[0] != 0) {
+                ++failures;
                 ipmiLog(LOG_ERR, "%s: GET_SEL(size %d), failed ccode = 0x%x,", "load_events", 255, a[0]);
             } else if (loaded < capacity + kExtraRecords) {
                 memcpy(&out[loaded++], a + sel::entryAnswer::data, sel::recordSize);
@@ -268,6 +292,8 @@ bool load_events(int fd, Event_log* out, int* n, uint16_t* lastRecordId) {
         } else if (len == 1 && a[0] == cc::reservationCancelled) {
             ipmiLog(LOG_INFO, "%s: lost reservation %u", "load_events", mc_reservation);
             return false;
+        } else {
+            ++failures;
         }
     }
     *n = loaded;
@@ -318,12 +344,21 @@ bool sync_device_eventlog(Event_log** records, int* n, sel_state* state) {
         if (out == nullptr) {
             ipmiLog(LOG_ERR, "%s: out of memory", "fetch_main_sel");
         } else {
-            get_sel_reservation(fd);
             loaded = newCount;
             uint16_t last = state->lastRecordId;
-            if (load_events(fd, out, &loaded, &last)) {
+            // Reading on with an old reservation would only be refused.
+            if (!get_sel_reservation(fd)) {
+                loaded = 0;
+            } else if (load_events(fd, out, &loaded, &last)) {
+                const bool fromStart = state->lastRecordId == 0;
                 state->lastRecordId = last;
                 ok = true;
+                // Cut short: the next call asks for the rest, as if only the
+                // records read had been there (a full log reloads anyway).
+                if (loaded >= kCallRecords && state->freeBytes != 0) {
+                    state->addStamp = saved.addStamp;
+                    state->count = static_cast<uint16_t>((fromStart ? 0 : saved.count) + loaded);
+                }
             } else {
                 ipmiLog(LOG_ERR, "%s: retrieve %d out of %d SEL events failed, try %d of %d", "fetch_main_sel",
                         newCount, state->count, 1, 1);

@@ -71,6 +71,21 @@ const char* sensorTypeGroup(uint8_t sensorType) {
 
 IpmiSelData::IpmiSelData(sel_event_record* record, int node) : record_(*record), node_(node) {}
 
+uint64_t IpmiSelCursor::digestOf(const sel_event_record& record) {
+    const auto* bytes = reinterpret_cast<const uint8_t*>(&record);
+    uint64_t h = 0xcbf29ce484222325ull;
+    for (size_t i = 0; i < sizeof record; ++i) h = (h ^ bytes[i]) * 0x100000001b3ull;
+    return h != 0 ? h : 1;  // 0 means no cursor
+}
+
+IpmiSelCursor IpmiSelCursor::at(const IpmiSelData& record) {
+    IpmiSelCursor c;
+    c.recordId = record.recordId();
+    c.timestamp = record.messageTimeStamp();
+    c.digest = digestOf(record.record());
+    return c;
+}
+
 uint16_t IpmiSelData::recordId() const { return sel::le16(record_.record_id); }
 
 uint8_t IpmiSelData::recordType() const { return record_.record_type; }

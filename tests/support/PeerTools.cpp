@@ -65,7 +65,8 @@ std::string toolPath(const std::string& name) {
     return "";
 }
 
-ToolRun runTool(const std::string& profile, const std::string& tool, const std::vector<std::string>& args) {
+ToolRun runTool(const std::string& profile, const std::string& tool, const std::vector<std::string>& args,
+                const std::vector<std::string>& extraEnv, unsigned seconds) {
     ToolRun result;
     std::vector<std::string> env;
     for (char** e = environ; *e; ++e)
@@ -79,6 +80,7 @@ ToolRun runTool(const std::string& profile, const std::string& tool, const std::
         // The tools free little before they exit; their leaks are not ours to report.
         env.push_back("ASAN_OPTIONS=detect_leaks=0");
     }
+    env.insert(env.end(), extraEnv.begin(), extraEnv.end());
     std::vector<std::string> argStrings{tool};
     argStrings.insert(argStrings.end(), args.begin(), args.end());
     std::vector<char*> envp = pointers(env), argv = pointers(argStrings);
@@ -93,7 +95,7 @@ ToolRun runTool(const std::string& profile, const std::string& tool, const std::
         dup2(out[1], 1);
         dup2(errFd, 2);
         close(out[0]);
-        alarm(60);  // a hung tool ends the test instead of stalling it
+        alarm(seconds);  // a hung tool ends the test instead of stalling it
         execve(argv[0], argv.data(), envp.data());
         _exit(127);
     }

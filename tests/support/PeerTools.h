@@ -24,7 +24,10 @@ std::string toolPath(const std::string& name);
 // Runs `tool args...` with the simulator behind its /dev/ipmi0, loaded from
 // `profile` (a path, or "default"; empty: no simulator at all). Time is
 // virtual, so requests the controller leaves unanswered cost nothing.
-ToolRun runTool(const std::string& profile, const std::string& tool, const std::vector<std::string>& args);
+// `extraEnv` adds NAME=VALUE entries; the tool is killed (SIGALRM) after
+// `seconds` of real time.
+ToolRun runTool(const std::string& profile, const std::string& tool, const std::vector<std::string>& args,
+                const std::vector<std::string>& extraEnv = {}, unsigned seconds = 60);
 
 // `ipmi-sensors` on the simulator with a fresh SDR cache of its own.
 ToolRun runIpmiSensors(const std::string& profile, const std::vector<std::string>& extraArgs = {});

@@ -3,9 +3,11 @@
 #include <stdio.h>
 #include <stdlib.h>
 
+#include <atomic>
 #include <mutex>
 #include <set>
 #include <string>
+#include <thread>
 
 #include "IpmiFru.h"
 #include "IpmiIfc.h"
@@ -68,6 +70,27 @@ void checkSel(Checks& checks) {
     }
     checks.expect(deliveredCount() == 2 && distinct.size() == 2, "each added SEL record is delivered exactly once",
                   std::to_string(deliveredCount()) + " deliveries, " + std::to_string(distinct.size()) + " records");
+
+    // A burst while the loop reads: 24 records, many within one second of
+    // the controller's clock, added in groups between and during passes.
+    std::atomic<bool> bursting{true};
+    std::thread burst([&bursting] {
+        for (int group = 0; group < 8; ++group) proxy({kSelAdd, 3});
+        bursting = false;
+    });
+    while (bursting) fullPass();
+    burst.join();
+    fullPass();
+    fullPass();
+    {
+        std::lock_guard<std::mutex> lock(deliveredMutex);
+        distinct.clear();
+        distinct.insert(delivered.begin(), delivered.end());
+    }
+    checks.expect(deliveredCount() == 26 && distinct.size() == 26 && selEntries() == 29,
+                  "a burst of 24 SEL records added while the loop reads is delivered exactly once",
+                  std::to_string(deliveredCount()) + " deliveries, " + std::to_string(distinct.size()) +
+                      " records, ipmitool counts " + std::to_string(selEntries()));
 }
 // Every FRU device ipmitool prints is in the library's inventory, with the
 // same board serial number where the board area has one.
