@@ -42,8 +42,8 @@ enum IPMI_POLL_TYPE {
 /// overload without the node for node 0 (the only node served).
 ///
 /// Groups, in this order: lifecycle, sensors, entities, FRU inventory,
-/// system event log, LAN, identity, raw commands. See the reference's main
-/// page for the contract every call follows: @ref contract-threads "threads",
+/// system event log, LAN, identity, raw commands, monitoring. See the
+/// reference's main page for the contract every call follows: @ref contract-threads "threads",
 /// @ref contract-blocking "blocking", @ref contract-lifetime "lifetime",
 /// @ref contract-exceptions "exceptions", @ref contract-logging "logging".
 class TAV_IPMI_API IpmiIfc {
