@@ -42,8 +42,8 @@ enum IPMI_POLL_TYPE {
 /// overload without the node for node 0 (the only node served).
 ///
 /// Groups, in this order: lifecycle, sensors, entities, FRU inventory,
-/// system event log, LAN, identity, raw commands. See the reference's main
-/// page for the contract every call follows: @ref contract-threads "threads",
+/// system event log, LAN, identity, raw commands, monitoring. See the
+/// reference's main page for the contract every call follows: @ref contract-threads "threads",
 /// @ref contract-blocking "blocking", @ref contract-lifetime "lifetime",
 /// @ref contract-exceptions "exceptions", @ref contract-logging "logging".
 class TAV_IPMI_API IpmiIfc {
@@ -422,6 +422,67 @@ public:
     /// @overload
     static uint8_t sendCmd(uint8_t cmd, uint8_t netfn, uint16_t data_len, uint8_t* data,
                            uint16_t* resp_len, uint8_t* resp_buf);
+    /// @}
+
+    /// @defgroup monitoring Monitoring
+    /// What the polling loop and the transport observe, for an exporter or a
+    /// provider that must tell fresh data from stale. Observing sends
+    /// nothing and never throws: every call reads values stored atomically,
+    /// from any thread, while the loop runs. Node 0 serves every node. Times
+    /// are Unix seconds of the time of day, 0 when never.
+    /// @{
+
+    /// The caches the loop refreshes.
+    enum IPMI_CACHE {
+        IPMI_CACHE_SENSORS = 0,  ///< sensor readings and thresholds
+        IPMI_CACHE_SDR = 1,      ///< the SDR repository, with the sensors and entities built from it
+        IPMI_CACHE_SEL = 2,      ///< SEL info and records
+        IPMI_CACHE_FRU = 3,      ///< the FRU inventory
+        IPMI_CACHE_LAN = 4,      ///< the LAN settings
+        IPMI_CACHE_COUNT = 5     ///< the number of caches
+    };
+    /// How an exchange with the controller ended.
+    enum IPMI_EXCHANGE_RESULT {
+        IPMI_EXCHANGE_OK = 0,               ///< answered with completion code 0
+        IPMI_EXCHANGE_COMPLETION_CODE = 1,  ///< answered with another completion code, 0xC3 excepted
+        IPMI_EXCHANGE_TIMEOUT = 2,          ///< no answer in time, or the driver's time-out code 0xC3
+        IPMI_EXCHANGE_ERROR = 3,            ///< the device failed (send, wait or receive) or is not open
+        IPMI_EXCHANGE_RESULT_COUNT = 4      ///< the number of results
+    };
+
+    /// When the loop's last pass ended; the reads before its first sleep
+    /// count as a pass.
+    static double getLastPassTime(int node);
+    /// @overload
+    static double getLastPassTime();
+
+    /// Whether the last pass reached the controller: at least one of its
+    /// exchanges was answered (time-outs are not answers).
+    static bool lastPassReachedController(int node);
+    /// @overload
+    static bool lastPassReachedController();
+
+    /// When the last pass that reached the controller ended.
+    static double getLastSuccessfulPassTime(int node);
+    /// @overload
+    static double getLastSuccessfulPassTime();
+
+    /// How long the last pass took, in seconds (monotonic clock).
+    static double getLastPassDuration(int node);
+    /// @overload
+    static double getLastPassDuration();
+
+    /// When the loop last refreshed `cache`: the refresh succeeded, and none
+    /// of its exchanges timed out or failed. 0 for an unknown cache.
+    static double getCacheRefreshTime(int node, IPMI_CACHE cache);
+    /// @overload
+    static double getCacheRefreshTime(IPMI_CACHE cache);
+
+    /// Exchanges with the controller since the process started, by result;
+    /// every thread's count, the loop's and callers' own. 0 for an unknown result.
+    static uint64_t getExchangeCount(int node, IPMI_EXCHANGE_RESULT result);
+    /// @overload
+    static uint64_t getExchangeCount(IPMI_EXCHANGE_RESULT result);
     /// @}
 };
 

@@ -15,6 +15,10 @@ command -v pkg-config >/dev/null || need+=(pkg-config)
 [ -f /usr/include/CLI/CLI.hpp ] || need+=(libcli11-dev)
 [ -f /usr/include/nlohmann/json.hpp ] || need+=(nlohmann-json3-dev)
 [ -f /usr/include/httplib.h ] || need+=(libcpp-httplib-dev)
+# `serve --web.config.file`: TLS, the file's YAML, bcrypt password hashes.
+[ -f /usr/include/openssl/ssl.h ] || need+=(libssl-dev)
+[ -f /usr/include/yaml-cpp/yaml.h ] || need+=(libyaml-cpp-dev)
+[ -f /usr/include/crypt.h ] || need+=(libcrypt-dev)
 command -v curl >/dev/null || need+=(curl)
 # The API reference and its check that every public declaration is documented.
 command -v doxygen >/dev/null || need+=(doxygen)

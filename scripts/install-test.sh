@@ -17,13 +17,26 @@ fail() { echo "install test: $*" >&2; exit 1; }
 
 DESTDIR="$stage/root" cmake --install "$build" --prefix "$prefix" >/dev/null
 root="$stage/root$prefix"
-for f in bin/tavipmi include/tav-ipmi/IpmiIfc.h share/man/man1/tavipmi.1 etc/sfcb/tav/sensor_health; do
+for f in bin/tavipmi include/tav-ipmi/IpmiIfc.h share/man/man1/tavipmi.1 etc/sfcb/tav/sensor_health \
+  lib/systemd/system/tavipmi.service share/tav-ipmi/prometheus/tavipmi-rules.yml; do
   [ -e "$root/$f" ] || fail "$f not installed"
 done
 libdir=$(dirname "$(find "$root" -name 'libtav-ipmi.so' | head -n1)")
 [ -n "$libdir" ] || fail "libtav-ipmi.so not installed"
 [ -e "$libdir/tav-ipmi/libtav-ipmi-sim-preload.so" ] || fail "the simulator's preload library is not installed"
 if grep -rlF -e "$build" -e "$src" "$root"; then fail "installed files above name the build or source tree"; fi
+
+# The unit starts the installed tool and ships hardened: systemd's own
+# offline assessment rates its exposure 2.0 or less (a bare unit: 9.6).
+unit="$root/lib/systemd/system/tavipmi.service"
+grep -qx "ExecStart=$prefix/bin/tavipmi serve" "$unit" || fail "the unit does not start $prefix/bin/tavipmi"
+if command -v systemd-analyze >/dev/null; then
+  exposure=$(systemd-analyze security --offline=true "$unit" 2>/dev/null |
+    sed -n 's/.*Overall exposure level for tavipmi.service: \([0-9.]*\).*/\1/p')
+  [ -n "$exposure" ] || fail "systemd-analyze gave no exposure for the unit"
+  awk -v e="$exposure" 'BEGIN { exit !(e <= 2.0) }' || fail "the unit's exposure is $exposure, above 2.0"
+  echo "install test: the unit's exposure is $exposure"
+fi
 
 cat > "$stage/consumer.cpp" <<'CPP'
 #include <stdio.h>

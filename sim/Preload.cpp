@@ -18,7 +18,10 @@
 // logs, so the log outlives the program as a real controller's does.
 // TAV_IPMI_SIM_CONTROL=1 lets a test steer a running program's simulator by
 // signals: SIGUSR1 adds an event to the SEL, SIGUSR2 prints the exchanges so
-// far per command on stderr.
+// far per command on stderr, SIGRTMIN takes the inlet temperature past its
+// upper critical threshold (and logs the event, as a controller does),
+// SIGRTMIN+1 makes the controller silent (every request ends in the driver's
+// time-out code) and SIGRTMIN+2 makes it answer again.
 
 #include <errno.h>
 #include <pthread.h>
@@ -91,6 +94,33 @@ void addSelEvent(Sim::Bmc& b) {
     Sim::addSelRecord(b, record);
 }
 
+// Sensor 1 of the default profile, the inlet temperature: upper critical 47 C.
+constexpr uint8_t kInletSensor = 0x01;
+constexpr uint8_t kPastUpperCritical = 49;
+constexpr uint16_t kUpperNonCriticalAndCritical = 0x18;  // comparison bits 3 and 4
+
+void crossUpperCritical(Sim::Bmc& b) {
+    Sim::SensorModel* s = b.findSensor(0x20, 0, kInletSensor);
+    if (s == nullptr) return;
+    s->reading = kPastUpperCritical;
+    s->states = kUpperNonCriticalAndCritical;
+    const uint8_t record[16] = {0, 0, 0x02, 0, 0, 0, 0, 0x20, 0x00, 0x04,
+                                0x01,  // temperature
+                                kInletSensor,
+                                0x01,  // threshold, assertion
+                                0x59,  // upper critical going high, with trigger reading and threshold
+                                kPastUpperCritical, 0x2F};
+    Sim::addSelRecord(b, record);
+}
+
+// What the Linux driver answers for a controller that stopped answering: its
+// own time-out code, after its retries.
+void silence(bool on) {
+    auto& sim = Sim::Simulator::instance();
+    sim.clearFaults();
+    if (on) sim.addFault(Sim::kAnyCommand, Sim::kAnyCommand, Sim::Fault::completionCode(0xC3, -1));
+}
+
 void printCounters(FILE* out, const char* format) {
     for (const auto& c : Sim::Simulator::instance().counters()) fprintf(out, format, c.first >> 8, c.first & 0xFF, c.second);
 }
@@ -105,6 +135,13 @@ void* controlThread(void* arg) {
                 addSelEvent(b);
                 keepSel(b);
             });
+        if (sig == SIGRTMIN)
+            Sim::Simulator::instance().withBmc([](Sim::Bmc& b) {
+                crossUpperCritical(b);
+                keepSel(b);
+            });
+        if (sig == SIGRTMIN + 1) silence(true);
+        if (sig == SIGRTMIN + 2) silence(false);
         if (sig == SIGUSR2) {
             printCounters(stderr, "tav-ipmi simulator: exchanges netfn 0x%02x cmd 0x%02x: %u\n");
             fprintf(stderr, "tav-ipmi simulator: exchanges total: %u\n", Sim::Simulator::instance().totalExchanges());
@@ -120,6 +157,7 @@ void startControl() {
     sigemptyset(&signals);
     sigaddset(&signals, SIGUSR1);
     sigaddset(&signals, SIGUSR2);
+    for (int rt = 0; rt < 3; ++rt) sigaddset(&signals, SIGRTMIN + rt);
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
     pthread_t thread;
     if (pthread_create(&thread, nullptr, controlThread, &signals) == 0) pthread_detach(thread);

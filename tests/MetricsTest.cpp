@@ -32,6 +32,25 @@ TEST_F(Metrics, ScrapesWhileTheLoopRefreshesReadTheCaches) {
     EXPECT_GT(sim().exchanges(netfn::sensorEvent, cmd::getSensorReading), 0u);
 }
 
+// `serve` leaves out a reading (with its state and health) older than its
+// max age: not current any more. The thresholds stay.
+TEST_F(Metrics, ReadingsOlderThanTheMaxAgeAreLeftOut) {
+    useBmc(Sim::loadProfile(Sim::defaultProfilePath()));
+    ASSERT_EQ(IpmiIfcOpenIpmiOpen(0), node().fd);
+    ASSERT_EQ(IpmiIfcSdrGetInfo(0), 0u);
+    const std::string labels = "{name=\"PS1 Input Power\",number=\"64\",entity=\"10.1\",type=\"Other\"}";
+    const std::string series[] = {"tavipmi_sensor_watts" + labels + " 232\n", "tavipmi_sensor_state" + labels,
+                                  "tavipmi_sensor_health_state" + labels};
+    Tool::setReadingMaxAge(60);
+    std::string text = Tool::metricsText();
+    for (const auto& s : series) EXPECT_NE(text.find(s), std::string::npos) << s;
+    sim().clock().advanceNs(61'000'000'000);
+    text = Tool::metricsText();
+    Tool::setReadingMaxAge(0);
+    for (const auto& s : series) EXPECT_EQ(text.find(s), std::string::npos) << s;
+    EXPECT_NE(text.find("tavipmi_sensor_threshold_celsius{name=\"Inlet Temp\""), std::string::npos);
+}
+
 }  // namespace
 
 #endif

@@ -1,7 +1,9 @@
 #include "Metrics.h"
 
 #include <stdio.h>
+#include <time.h>
 
+#include <atomic>
 #include <cctype>
 
 #include "IpmiIfc.h"
@@ -11,6 +13,14 @@
 namespace Tool {
 
 namespace {
+
+std::atomic<double> readingMaxAge{0};
+
+// Whether a reading taken at `readingTimeUs` (0: never) is current now.
+bool current(uint64_t readingTimeUs, double nowSeconds) {
+    const double maxAge = readingMaxAge.load();
+    return maxAge <= 0 || (readingTimeUs != 0 && nowSeconds - static_cast<double>(readingTimeUs) / 1e6 <= maxAge);
+}
 
 std::vector<MetricSource>& sources() {
     static std::vector<MetricSource> all;
@@ -70,11 +80,15 @@ void addIdentity(MetricSet& m) {
 }
 
 void addSensors(MetricSet& m) {
+    struct timespec now;
+    clock_gettime(CLOCK_REALTIME, &now);
+    const double nowSeconds = static_cast<double>(now.tv_sec) + now.tv_nsec / 1e9;
     for (const auto& f : sensorFacts(false)) {
+        const bool fresh = current(f.readingTime, nowSeconds);
         const Labels labels = {
             {"name", f.name}, {"number", std::to_string(f.number)}, {"entity", f.entity}, {"type", f.type}};
         const std::string suffix = unitSuffix(f.unit);
-        if (f.reading)
+        if (f.reading && fresh)
             m.add("tavipmi_sensor_" + suffix, "gauge", "Sensor reading in " + (f.unit.empty() ? "raw units" : f.unit) + ".",
                   labels, *f.reading);
         for (int t = 0; t < kThresholds; ++t) {
@@ -85,11 +99,11 @@ void addSensors(MetricSet& m) {
                   "Sensor threshold in " + (f.unit.empty() ? "raw units" : f.unit) + ".", withThreshold,
                   *f.threshold[t]);
         }
-        if (f.stateBits)
+        if (f.stateBits && fresh)
             m.add("tavipmi_sensor_state", "gauge",
                   "State bits of the last reading: thresholds crossed (bit 0 lnc to bit 5 unr) or discrete states.",
                   labels, *f.stateBits);
-        if (f.health)
+        if (f.health && fresh)
             m.add("tavipmi_sensor_health_state", "gauge",
                   "CIM HealthState of the sensor: 0 unknown, 5 OK, 10 degraded, 25 critical failure.", labels,
                   *f.health);
@@ -126,6 +140,8 @@ std::string MetricSet::text() const {
 }
 
 void addMetricSource(MetricSource source) { sources().push_back(std::move(source)); }
+
+void setReadingMaxAge(double seconds) { readingMaxAge.store(seconds); }
 
 std::string metricsText() {
     MetricSet m;

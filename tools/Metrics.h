@@ -37,6 +37,11 @@ void addMetricSource(MetricSource source);
 // Every series: controller identity, sensors, and the registered sources.
 std::string metricsText();
 
+// A reading (with its state bits and health state) taken longer ago than
+// this many seconds is not current and is left out; thresholds stay. 0 (the
+// default, for the one-shot `metrics`) publishes every reading.
+void setReadingMaxAge(double seconds);
+
 }  // namespace Tool
 
 #endif

@@ -9,6 +9,7 @@
 
 #include <atomic>
 #include <exception>
+#include <memory>
 #include <string>
 #include <thread>
 
@@ -19,21 +20,37 @@
 #include "Identity.h"
 #include "IpmiIfc.h"
 #include "IpmiSelData.h"
+#include "LoopHealth.h"
 #include "Metrics.h"
 #include "SelCursorFile.h"
 #include "SelFacts.h"
 #include "Views.h"
+#include "WebConfig.h"
 
 namespace {
 
 std::string listen = "127.0.0.1:9623";
 int interval = 1;
+double maxAge = 0;
+std::string webConfigFile;
+
+// The loop reads sensors on one pass in eight, a pass every 16 s per unit of
+// the interval: the default age allows three such periods.
+constexpr int kSecondsPerReadingPeriod = 8 * 16;
+constexpr int kDefaultPeriods = 3;
 Tool::SelCursorFile selState;
 
 void serveOptions(CLI::App& sub) {
     sub.add_option("--listen", listen, "HOST:PORT to answer on (default 127.0.0.1:9623; port 0: any free port)");
     sub.add_option("--interval", interval, "polling interval in units of 16 seconds (default 1)")
         ->check(CLI::PositiveNumber);
+    sub.add_option("--max-age", maxAge,
+                   "seconds after which a reading is not published as current (default three reading periods: "
+                   "384 s per unit of --interval)")
+        ->check(CLI::PositiveNumber);
+    sub.add_option("--web.config.file", webConfigFile,
+                   "Prometheus web configuration file: TLS certificate and key, client certificates, basic-auth "
+                   "users with bcrypt hashes");
     selState.addOption(sub, "serve.state");
 }
 
@@ -77,6 +94,16 @@ int serve(std::vector<Tool::Section>&) {
         fprintf(stderr, "tavipmi: --listen wants HOST:PORT, not '%s'\n", listen.c_str());
         return 2;
     }
+    Tool::WebConfig web;
+    std::string error;
+    if (!webConfigFile.empty() && !Tool::loadWebConfig(webConfigFile, web, error)) {
+        fprintf(stderr, "tavipmi: --web.config.file %s\n", error.c_str());
+        return 2;
+    }
+    if (maxAge <= 0) maxAge = static_cast<double>(kDefaultPeriods) * kSecondsPerReadingPeriod * interval;
+    Tool::setReadingMaxAge(maxAge);
+    Tool::addMetricSource([](Tool::MetricSet& m) { Tool::addLoopHealth(m, maxAge); });
+
     // SIGTERM and SIGINT are taken by this thread alone, so every thread
     // started from here on inherits the block.
     sigset_t stopSignals;
@@ -85,12 +112,25 @@ int serve(std::vector<Tool::Section>&) {
     sigaddset(&stopSignals, SIGINT);
     pthread_sigmask(SIG_BLOCK, &stopSignals, nullptr);
 
-    httplib::Server server;
+    std::unique_ptr<httplib::Server> made = Tool::makeServer(web, error);
+    if (!made) {
+        fprintf(stderr, "tavipmi: --web.config.file %s: %s\n", webConfigFile.c_str(), error.c_str());
+        return 1;
+    }
+    httplib::Server& server = *made;
     // One worker answers one request per connection: a scrape takes
     // milliseconds, and no client can hold the worker with an idle
     // keep-alive connection.
     server.new_task_queue = [] { return new httplib::ThreadPool(1); };
     server.set_keep_alive_max_count(1);
+    auto auth = std::make_shared<Tool::BasicAuth>(web.users);
+    server.set_pre_routing_handler([auth](const httplib::Request& req, httplib::Response& res) {
+        if (auth->allows(req.get_header_value("Authorization"))) return httplib::Server::HandlerResponse::Unhandled;
+        res.status = 401;
+        res.set_header("WWW-Authenticate", "Basic realm=\"tavipmi\"");
+        res.set_content("Unauthorized\n", "text/plain; charset=utf-8");
+        return httplib::Server::HandlerResponse::Handled;
+    });
     server.Get("/metrics", [](const httplib::Request&, httplib::Response& res) {
         res.set_content(Tool::metricsText(), "text/plain; version=0.0.4; charset=utf-8");
     });
@@ -118,7 +158,7 @@ int serve(std::vector<Tool::Section>&) {
     // start() clears the handler list: the count starts once the loop runs.
     Ipmi::IpmiIfc::registerSelEventHandler(countEvent, nullptr);
     std::thread http([&server] { server.listen_after_bind(); });
-    fprintf(stderr, "tavipmi: serving metrics on http://%s:%d/metrics\n",
+    fprintf(stderr, "tavipmi: serving metrics on %s://%s:%d/metrics\n", web.tls() ? "https" : "http",
             host.find(':') == std::string::npos ? host.c_str() : ("[" + host + "]").c_str(), port);
 
     int sig = 0;

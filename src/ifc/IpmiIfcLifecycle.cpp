@@ -18,6 +18,7 @@
 
 #include "IpmiIfcInternal.h"
 #include "IpmiIfcSel.h"
+#include "IpmiIfcWatch.h"
 #include "IpmiLan.h"
 #include "IpmiMapper.h"
 
@@ -130,7 +131,10 @@ enum class PassEnd { Continue, Stop };
 void readSelCount(IpmiNode& n, IpmiLoopState& s) {
     int tries = 0;
     while (tries < kSelInfoTries) {
-        if (IpmiIfcSelGetInfo(0, &s.entryCount) == 0) return;
+        IpmiRefreshWatch watch;
+        const bool read = IpmiIfcSelGetInfo(0, &s.entryCount) == 0;
+        watch.finish(IpmiIfc::IPMI_CACHE_SEL, read);
+        if (read) return;
         if (tries == 0) ipmiLog(LOG_DEBUG, "Retrying IpmiIfcSelGetInfo");
         ++tries;
         if (stopping(n)) return;
@@ -141,7 +145,29 @@ void readSelCount(IpmiNode& n, IpmiLoopState& s) {
 
 void refreshFru() {
     ipmiLog(LOG_DEBUG, "IpmiIfc::poll - Refreshing FRU");
-    IpmiIfcFruInstantiateAll(0);
+    IpmiRefreshWatch watch;
+    watch.finish(IpmiIfc::IPMI_CACHE_FRU, IpmiIfcFruInstantiateAll(0) == 0);
+}
+
+// The refreshes below stamp their cache for monitoring; the calls and their
+// order are the loop's own.
+void updateReadings() {
+    IpmiRefreshWatch watch;
+    watch.finish(IpmiIfc::IPMI_CACHE_SENSORS, IpmiIfcSensorUpdateReading(0) == 0);
+}
+
+// An accepted Get SDR Repository Info answer reads the records and rebuilds
+// the sensors from them, readings included.
+void readSdr() {
+    IpmiRefreshWatch watch;
+    const bool read = IpmiIfcSdrGetInfo(0) == 0;
+    watch.finish(IpmiIfc::IPMI_CACHE_SDR, read);
+    watch.finish(IpmiIfc::IPMI_CACHE_SENSORS, read);
+}
+
+void refreshLan() {
+    IpmiRefreshWatch watch;
+    watch.finish(IpmiIfc::IPMI_CACHE_LAN, IpmiIfc::getLan(0)->IpmiIfcLanInstantiate(0) == 0);
 }
 
 // One pass after a wake-up (pollCount already advanced).
@@ -153,7 +179,7 @@ PassEnd runPass(IpmiNode& n, IpmiLoopState& s) {
     const bool noNews = s.entryCount == s.lastEntryCount || (s.lastEntryCount != 0 && s.entryCount == 1);
     if (noNews && n.pollType != IPMI_POLL_FULL) {
         if (skip != 0) {
-            if (n.pollType == IPMI_POLL_SENSORS) IpmiIfcSensorUpdateReading(0);
+            if (n.pollType == IPMI_POLL_SENSORS) updateReadings();
             return PassEnd::Continue;
         }
         if (n.pollType == IPMI_POLL_SEL) {
@@ -162,7 +188,7 @@ PassEnd runPass(IpmiNode& n, IpmiLoopState& s) {
         }
         if (n.pollType == IPMI_POLL_SENSORS) {
             n.pollCount += kPeriodicMask;
-            IpmiIfcSensorUpdateReading(0);
+            updateReadings();
             return PassEnd::Continue;
         }
         s.fullRefresh = false;
@@ -180,10 +206,10 @@ PassEnd runPass(IpmiNode& n, IpmiLoopState& s) {
     if (stopping(n)) return PassEnd::Stop;
 
     if (s.fullRefresh || s.sdrCycle % skipStep(&SKIP_SDR_STEP) == 0) {
-        IpmiIfcSdrGetInfo(0);
+        readSdr();
         if (stopping(n)) return PassEnd::Stop;
     } else {
-        IpmiIfcSensorUpdateReading(0);
+        updateReadings();
     }
 
     callHandlersWithoutRecord();
@@ -197,7 +223,7 @@ PassEnd runPass(IpmiNode& n, IpmiLoopState& s) {
     }
 
     if (stopping(n)) return PassEnd::Stop;
-    IpmiIfc::getLan(0)->IpmiIfcLanInstantiate(0);
+    refreshLan();
     return stopping(n) ? PassEnd::Stop : PassEnd::Continue;
 }
 
@@ -212,10 +238,15 @@ void IpmiIfc::poll(int) {
 
     // Not guarded: a failure here ends the loop and start.
     IpmiLoopState s;
-    IpmiIfcSelGetInfo(0, &s.entryCount);
-    s.lastEntryCount = s.entryCount;
-    getLan(0)->IpmiIfcLanInstantiate(0);
-    IpmiIfcFruInstantiateAll(0);
+    {
+        IpmiPassWatch pass;
+        IpmiRefreshWatch sel;
+        sel.finish(IPMI_CACHE_SEL, IpmiIfcSelGetInfo(0, &s.entryCount) == 0);
+        s.lastEntryCount = s.entryCount;
+        refreshLan();
+        IpmiRefreshWatch fru;
+        fru.finish(IPMI_CACHE_FRU, IpmiIfcFruInstantiateAll(0) == 0);
+    }
 
     for (;;) {
         if (stopping(n)) break;
@@ -229,6 +260,7 @@ void IpmiIfc::poll(int) {
         if (stopping(n)) break;
         n.pollCount += 1;
         try {
+            IpmiPassWatch pass;
             if (!IpmiIfcPollPass(0, s)) break;
         } catch (...) {
             rethrowIfUnwinding();
@@ -269,7 +301,14 @@ void IpmiIfc::start(int node, int interval) {
             int getsEvents = 0;  // events are learnt from the SEL, not from the driver
             IpmiIfcOpenIpmiEventEnable(0, &getsEvents);
             IpmiIfcOpenIpmiAddressSet(0);
+            IpmiRefreshWatch identity;
             IpmiIfcDataGet(7);
+            // Get SDR Repository Info is among the one-shot commands; the
+            // stored answer stays zero (version 0) until one is accepted.
+            const ipmiifc_sdr_info sdr = getSdr(0);
+            const bool sdrRead = sdr.cc == cc::ok && sdr.version != 0;
+            identity.finish(IPMI_CACHE_SDR, sdrRead);
+            identity.finish(IPMI_CACHE_SENSORS, sdrRead);
             _changeState(0, IPMI_STATE_STARTING, IPMI_STATE_RUNNING);
             ipmiLog(LOG_DEBUG, "%s: Node %d: IpmiIfc initialization complete", "start", 0);
             poll(0);

@@ -14,6 +14,7 @@
 #include <new>
 
 #include "IpmiIfcInternal.h"
+#include "IpmiIfcWatch.h"
 
 namespace Ipmi {
 
@@ -175,13 +176,17 @@ ipmiifc_resp* failExchange(int node, ipmiifc_resp* reuse) {
     return nullptr;
 }
 
-}  // namespace
+// How an exchange ended, for monitoring; Stopped ones are not counted.
+enum class Outcome { Answered, TimedOut, Failed, Stopped };
 
-ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiifc_resp* reuse) {
+ipmiifc_resp* exchangeOnce(int node, ipmiifc_req* req, int flags, ipmiifc_resp* reuse, Outcome& outcome) {
     IpmiNode& n = g_IpmiNode[0];
     TAV::MutexLock exchange(n.transportMutex);
+    outcome = Outcome::Stopped;
     // The flag first: once it is set, stop closes the device without this mutex.
-    if (n.stopRequested || n.fd < 1) return nullptr;
+    if (n.stopRequested) return nullptr;
+    outcome = Outcome::Failed;
+    if (n.fd < 1) return nullptr;
 
     struct ipmi_addr addr;
     buildAddress(n, &addr);
@@ -221,6 +226,7 @@ ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiif
         fds[1].revents = 0;
         int ready = leftMs > 0 ? ::poll(fds, 2, static_cast<int>(leftMs)) : 0;
         if (ready == 0) {
+            outcome = Outcome::TimedOut;
             ipmiLog(LOG_WARNING, "Node %d: poll(fd=%d) timeout with no reply.", 0, n.fd);
             if (resp != reuse) IpmiIfcRespDel(&resp);
             return failExchange(node, reuse);
@@ -232,6 +238,7 @@ ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiif
             return failExchange(node, reuse);
         }
         if (n.stopRequested) {
+            outcome = Outcome::Stopped;
             if (resp != reuse) IpmiIfcRespDel(&resp);
             return nullptr;
         }
@@ -285,6 +292,7 @@ ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiif
         ipmiLog(LOG_DEBUG, "Node %d: dropped a stale answer (msgid %ld, netfn 0x%02x, cmd 0x%02x)", 0, recv.msgid,
                 recv.msg.netfn, recv.msg.cmd);
     }
+    if (resp->data_len > 0) outcome = Outcome::Answered;
     if (resp->cc != 0 || resp->data_len == 0) return resp;
 
     resp->node = 0;
@@ -299,6 +307,24 @@ ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiif
             resp->req_data = static_cast<uint8_t*>(malloc(req->data_len));
             if (resp->req_data) memcpy(resp->req_data, req->data, req->data_len);
         }
+    }
+    return resp;
+}
+
+}  // namespace
+
+ipmiifc_resp* IpmiIfcSendWresponse(int node, ipmiifc_req* req, int flags, ipmiifc_resp* reuse) {
+    Outcome outcome = Outcome::Failed;
+    ipmiifc_resp* resp = exchangeOnce(node, req, flags, reuse, outcome);
+    switch (outcome) {
+    case Outcome::Answered:
+        IpmiIfcWatchExchange(resp->cc == cc::ok        ? IpmiIfc::IPMI_EXCHANGE_OK
+                             : resp->cc == cc::timeout ? IpmiIfc::IPMI_EXCHANGE_TIMEOUT
+                                                       : IpmiIfc::IPMI_EXCHANGE_COMPLETION_CODE);
+        break;
+    case Outcome::TimedOut: IpmiIfcWatchExchange(IpmiIfc::IPMI_EXCHANGE_TIMEOUT); break;
+    case Outcome::Failed: IpmiIfcWatchExchange(IpmiIfc::IPMI_EXCHANGE_ERROR); break;
+    case Outcome::Stopped: break;
     }
     return resp;
 }
