@@ -1,6 +1,7 @@
 #ifndef TAV_IPMI_IPMICOMMANDS_H
 #define TAV_IPMI_IPMICOMMANDS_H
 
+#include <stddef.h>
 #include <stdint.h>
 
 // IPMI v2.0 network functions, commands and completion codes, named once for
@@ -127,6 +128,29 @@ constexpr uint8_t asyncSerial = 0x05;
 constexpr uint8_t otherLan = 0x06;
 constexpr uint8_t systemInterface = 0x0C;
 }  // namespace channelMedium
+
+// Get Device ID answer, completion code first.
+namespace deviceIdAnswer {
+constexpr size_t completionCode = 0;
+constexpr size_t deviceId = 1;
+constexpr size_t deviceRevision = 2;
+constexpr size_t fwRev1 = 3;
+constexpr size_t fwRev2 = 4;
+constexpr size_t ipmiVersion = 5;
+constexpr size_t manufacturer = 7;  // three bytes, least significant first
+constexpr size_t product = 10;      // two bytes
+constexpr size_t auxFirmware = 12;  // four bytes
+constexpr size_t size = 16;
+}  // namespace deviceIdAnswer
+
+// Get SDR Repository Info answer, completion code first.
+namespace sdrInfoAnswer {
+constexpr size_t version = 1;
+constexpr size_t recordCount = 2;    // u16 LE
+constexpr size_t additionStamp = 6;  // u32 LE
+constexpr size_t eraseStamp = 10;    // u32 LE
+constexpr size_t size = 15;
+}  // namespace sdrInfoAnswer
 }  // namespace Ipmi
 
 #endif

@@ -25,15 +25,6 @@ pthread_mutex_t manNameInitMut = PTHREAD_MUTEX_INITIALIZER;
 
 namespace {
 
-// Layout of the stored Get Device ID answer (completion code first).
-namespace deviceIdByte {
-constexpr size_t completionCode = 0;
-constexpr size_t fwRev1 = 3;
-constexpr size_t fwRev2 = 4;
-constexpr size_t ipmiVersion = 5;
-constexpr size_t manufacturer = 7;  // three bytes, least significant first
-constexpr size_t size = 16;
-}  // namespace deviceIdByte
 
 // Get System Info Parameters answer for a string parameter.
 namespace sysInfoByte {
@@ -177,7 +168,7 @@ int IpmiIfcRhGetDeviceId(ipmiifc_resp* r) {
     IpmiNode& n = responseNode(r);
     TAV::MutexLock guard(n.devInfoMutex);
     // Bytes the controller did not send are stored as zeros, not as stale buffer.
-    size_t got = r->data_len < deviceIdByte::size ? r->data_len : deviceIdByte::size;
+    size_t got = r->data_len < deviceIdAnswer::size ? r->data_len : deviceIdAnswer::size;
     memset(n.deviceId, 0, sizeof n.deviceId);
     memcpy(n.deviceId, r->data, got);
     std::string manufacturer = IpmiIfc::GetBmcManufacturer();
@@ -213,12 +204,12 @@ std::string IpmiIfc::GetBmcReportedOSVersion() { return os_version; }
 // Firmware revision 1 is masked with 0x3F, not 0x7F: kept as callers know it.
 std::string IpmiIfc::GetBmcFWVersion() {
     const uint8_t* id = storedDeviceId();
-    return dottedVersion(id[deviceIdByte::fwRev1] & 0x3F, "%x", id[deviceIdByte::fwRev2]);
+    return dottedVersion(id[deviceIdAnswer::fwRev1] & 0x3F, "%x", id[deviceIdAnswer::fwRev2]);
 }
 
 // The IPMI version byte holds the major version in its low nibble.
 std::string IpmiIfc::GetBmcIpmiVersion() {
-    const uint8_t v = storedDeviceId()[deviceIdByte::ipmiVersion];
+    const uint8_t v = storedDeviceId()[deviceIdAnswer::ipmiVersion];
     return dottedVersion(v & 0x0F, "%u", v >> 4);
 }
 
@@ -284,8 +275,8 @@ std::string IpmiIfc::GetBmcManufacturer() {
 // `count` is 1 although three bytes are written: callers take them as one id.
 int IpmiIfc::getManufacturerId(int, unsigned char* id, unsigned char& count) {
     const uint8_t* stored = storedDeviceId();
-    if (stored[deviceIdByte::completionCode] != 0 || id == nullptr) return 1;
-    memcpy(id, stored + deviceIdByte::manufacturer, 3);
+    if (stored[deviceIdAnswer::completionCode] != 0 || id == nullptr) return 1;
+    memcpy(id, stored + deviceIdAnswer::manufacturer, 3);
     count = 1;
     return 0;
 }
@@ -294,8 +285,8 @@ int IpmiIfc::getManufacturerId(unsigned char* id, unsigned char& count) { return
 
 int IpmiIfc::getManagementControllerInfo(int, ipmiifc_device_id& out) {
     const uint8_t* stored = storedDeviceId();
-    if (stored[deviceIdByte::completionCode] != 0) return 1;
-    static_assert(sizeof(ipmiifc_device_id) == deviceIdByte::size, "device id record is 16 bytes");
+    if (stored[deviceIdAnswer::completionCode] != 0) return 1;
+    static_assert(sizeof(ipmiifc_device_id) == deviceIdAnswer::size, "device id record is 16 bytes");
     memcpy(&out, stored, sizeof out);
     return 0;
 }

@@ -33,10 +33,7 @@ constexpr uint8_t kVersionAlwaysAccepted = 0x51;
 constexpr uint8_t kHighestInfoVersion = 2;
 
 // Stored Get SDR Repository Info answer, completion code first.
-constexpr size_t kInfoBytes = 15;
-constexpr size_t kInfoVersion = 1;
-constexpr size_t kInfoRecordCount = 2;  // u16 LE
-static_assert(sizeof(ipmiifc_sdr_info) == kInfoBytes, "the stored info is handed out as it is");
+static_assert(sizeof(ipmiifc_sdr_info) == sdrInfoAnswer::size, "the stored info is handed out as it is");
 
 // Stored Reserve SDR Repository answer: completion code, reservation id (LE).
 constexpr size_t kReservationBytes = 3;
@@ -62,8 +59,8 @@ void putLe16(uint8_t* p, uint16_t v) {
 
 bool validNode(int node) { return node >= 0 && node < IPMI_NODE_COUNT; }
 
-uint8_t storedVersion(const ipmiifc_sdr_state& s) { return s.info[kInfoVersion]; }
-uint16_t storedRecordCount(const ipmiifc_sdr_state& s) { return le16(s.info + kInfoRecordCount); }
+uint8_t storedVersion(const ipmiifc_sdr_state& s) { return s.info[sdrInfoAnswer::version]; }
+uint16_t storedRecordCount(const ipmiifc_sdr_state& s) { return le16(s.info + sdrInfoAnswer::recordCount); }
 uint16_t storedReservation(const ipmiifc_sdr_state& s) { return le16(s.reservation + kReservationId); }
 
 IpmiSdrGroup groupOf(uint8_t recordType) {
@@ -325,12 +322,12 @@ uint32_t acceptSdrInfo(ipmiifc_resp* resp, Rebuild rebuild) {
         ipmiLog(LOG_WARNING, "Inconsistent SDR Response codes %x != %x", resp->data[0], cc::ok);
         return kFailed;
     }
-    if (resp->data_len != kInfoBytes) {
+    if (resp->data_len != sdrInfoAnswer::size) {
         ipmiLog(LOG_WARNING, "SDR response buffer was wrong size %x (expecting %x)", resp->data_len,
-                static_cast<unsigned>(kInfoBytes));
+                static_cast<unsigned>(sdrInfoAnswer::size));
         return kFailed;
     }
-    const uint8_t version = resp->data[kInfoVersion];
+    const uint8_t version = resp->data[sdrInfoAnswer::version];
     if ((version & 0x0F) > kHighestInfoVersion) {
         ipmiLog(LOG_WARNING, "Unexpected SDR Repository info version 0x%x - discarding results ", version);
         return kFailed;
@@ -343,7 +340,7 @@ uint32_t acceptSdrInfo(ipmiifc_resp* resp, Rebuild rebuild) {
     {
         IpmiNode& n = g_IpmiNode[node];
         CacheWriteLock guard(n.cacheLock);
-        memcpy(n.work.sdr.info, resp->data, kInfoBytes);
+        memcpy(n.work.sdr.info, resp->data, sdrInfoAnswer::size);
     }
     // The cache is consulted only when asked for: without it the exchanges
     // are the ones a reader of the repository expects.

@@ -21,22 +21,6 @@ namespace Ipmi {
 
 namespace {
 
-// Repository info answer: completion code, version, record count (LE),
-// free space, addition stamp, erase stamp, operation support.
-constexpr size_t kInfoRecordCount = 2;
-constexpr size_t kInfoAdditionStamp = 6;
-constexpr size_t kInfoEraseStamp = 10;
-
-// Get Device ID answer, completion code first.
-namespace deviceIdAt {
-constexpr size_t deviceId = 1;
-constexpr size_t deviceRevision = 2;
-constexpr size_t firmware1 = 3;
-constexpr size_t firmware2 = 4;
-constexpr size_t manufacturer = 7;
-constexpr size_t product = 10;
-constexpr size_t auxFirmware = 12;
-}  // namespace deviceIdAt
 
 constexpr size_t kGuidBytes = 16;
 
@@ -120,16 +104,16 @@ SdrCacheKey sdrCacheKey(const uint8_t* info, const uint8_t* deviceId) {
     memset(key.bytes, 0, sizeof key.bytes);
     // Key bytes by their offset in the file.
     auto at = [&key](size_t fileOffset) { return key.bytes + (fileOffset - h::keyFirst); };
-    memcpy(at(h::recordCount), info + kInfoRecordCount, 2);
-    memcpy(at(h::additionStamp), info + kInfoAdditionStamp, 4);
-    memcpy(at(h::eraseStamp), info + kInfoEraseStamp, 4);
-    *at(h::deviceId) = deviceId[deviceIdAt::deviceId];
-    *at(h::deviceRevision) = deviceId[deviceIdAt::deviceRevision];
-    *at(h::firmware1) = deviceId[deviceIdAt::firmware1];
-    *at(h::firmware2) = deviceId[deviceIdAt::firmware2];
-    memcpy(at(h::manufacturer), deviceId + deviceIdAt::manufacturer, 3);
-    memcpy(at(h::product), deviceId + deviceIdAt::product, 2);
-    memcpy(at(h::auxFirmware), deviceId + deviceIdAt::auxFirmware, 4);
+    memcpy(at(h::recordCount), info + sdrInfoAnswer::recordCount, 2);
+    memcpy(at(h::additionStamp), info + sdrInfoAnswer::additionStamp, 4);
+    memcpy(at(h::eraseStamp), info + sdrInfoAnswer::eraseStamp, 4);
+    *at(h::deviceId) = deviceId[deviceIdAnswer::deviceId];
+    *at(h::deviceRevision) = deviceId[deviceIdAnswer::deviceRevision];
+    *at(h::firmware1) = deviceId[deviceIdAnswer::fwRev1];
+    *at(h::firmware2) = deviceId[deviceIdAnswer::fwRev2];
+    memcpy(at(h::manufacturer), deviceId + deviceIdAnswer::manufacturer, 3);
+    memcpy(at(h::product), deviceId + deviceIdAnswer::product, 2);
+    memcpy(at(h::auxFirmware), deviceId + deviceIdAnswer::auxFirmware, 4);
     return key;
 }
 
